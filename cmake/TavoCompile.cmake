@@ -1,0 +1,27 @@
+# The compile settings every target of this project shares, as one interface target.
+add_library(tavo_compile INTERFACE)
+target_compile_features(tavo_compile INTERFACE cxx_std_17 c_std_11)
+target_compile_options(tavo_compile INTERFACE
+    -Wall -Wextra -Wconversion -Wshadow -Wformat=2 -Wno-format-nonliteral -Werror
+    -fvisibility=hidden
+    $<$<COMPILE_LANGUAGE:CXX>:-fvisibility-inlines-hidden>)
+set(CMAKE_CXX_EXTENSIONS OFF)
+set(CMAKE_C_EXTENSIONS OFF)
+set(CMAKE_POSITION_INDEPENDENT_CODE ON)
+# The platform's libraries live in a folder of their own, so everything linked to them needs a RUNPATH.
+set(CMAKE_INSTALL_RPATH_USE_LINK_PATH ON)
+
+find_package(Threads REQUIRED)
+target_link_libraries(tavo_compile INTERFACE Threads::Threads)
+
+if(TAVO_SANITIZE)
+    # On every target, whether it asks for the warnings above or not: half-instrumented programs lie.
+    add_compile_options(-fsanitize=${TAVO_SANITIZE} -fno-omit-frame-pointer -fno-sanitize-recover=all)
+    add_link_options(-fsanitize=${TAVO_SANITIZE})
+endif()
+
+find_program(CCACHE ccache)
+if(CCACHE)
+    set(CMAKE_C_COMPILER_LAUNCHER ${CCACHE})
+    set(CMAKE_CXX_COMPILER_LAUNCHER ${CCACHE})
+endif()

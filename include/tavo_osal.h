@@ -1,0 +1,13 @@
+/**
+ * @file
+ * The whole C API. Include this, or the header of the family you need.
+ */
+#ifndef TAVO_OSAL_H
+#define TAVO_OSAL_H
+
+#include "tavo_osal/list.h"
+#include "tavo_osal/log.h"
+#include "tavo_osal/memory.h"
+#include "tavo_osal/status.h"
+
+#endif

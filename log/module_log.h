@@ -1,0 +1,25 @@
+// How the library's own sources log: TAVO_LOG(kTag, level, format, values...).
+//
+// A message that the filter drops costs a few loads and compares in line: no call, and the values are
+// not evaluated. Values must therefore be free of side effects.
+#pragma once
+
+#include "tavo_osal/log.h"
+
+namespace tavo {
+
+// The filter for messages of module 0, which all of the library's own are. The globals are read with
+// relaxed atomic loads (plain loads in machine code), since a preference may be set at any time.
+inline bool log_enabled(uint32_t level) {
+    if (level > __atomic_load_n(&g_uiMxEnabledLogLevel, __ATOMIC_RELAXED)) return false;
+    return level <= TAVO_LOG_WARNING || __atomic_load_n(&g_uiEnabledModuleMask, __ATOMIC_RELAXED) == UINT32_MAX;
+}
+
+}  // namespace tavo
+
+// A macro, because only a macro can take the caller's source line.
+#define TAVO_LOG(tag, level, ...)                                                    \
+    do {                                                                             \
+        if (__builtin_expect(tavo::log_enabled(level), (level) <= TAVO_LOG_WARNING)) \
+            tavo_print_log((level), 0, __LINE__, (tag), __VA_ARGS__);                \
+    } while (false)
