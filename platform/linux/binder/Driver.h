@@ -26,7 +26,7 @@ class BBinder;
 class BpBinder;
 class Parcel;
 
-class Driver {
+class LIBBINDER_EXPORT Driver {
 public:
     // The most bytes of data, and the most bytes of anything else, that one parcel may hold.
     static constexpr size_t kParcelLimit = 1024 * 1024;
@@ -38,7 +38,7 @@ public:
     };
 
     // What a driver asks of the process it serves.
-    class Process {
+    class LIBBINDER_EXPORT Process {
     public:
         // Runs a transaction on the calling thread: makes the caller known to IPCThreadState for as long as it
         // lasts and calls target's transact. For a oneway transaction reply is a parcel nobody will see.
