@@ -11,7 +11,7 @@
 
 // The kernel's header has the same macro; either may be included first.
 #ifndef B_PACK_CHARS
-#define B_PACK_CHARS(c1, c2, c3, c4) ((((c1)<<24)) | (((c2)<<16)) | (((c3)<<8)) | (c4))
+#define B_PACK_CHARS(c1, c2, c3, c4) ((((c1) << 24)) | (((c2) << 16)) | (((c3) << 8)) | (c4))
 #endif
 
 namespace android {

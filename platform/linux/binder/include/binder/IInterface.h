@@ -27,7 +27,7 @@ inline sp<INTERFACE> interface_cast(const sp<IBinder>& obj) {
 template <typename INTERFACE>
 class LIBBINDER_EXPORT BnInterface : public INTERFACE, public BBinder {
 public:
-    sp<IInterface> queryLocalInterface(const String16& descriptor) override;
+    sp<IInterface> queryLocalInterface(const String16& requested) override;
     const String16& getInterfaceDescriptor() const override;
 
 protected:
@@ -44,8 +44,8 @@ protected:
 };
 
 template <typename INTERFACE>
-inline sp<IInterface> BnInterface<INTERFACE>::queryLocalInterface(const String16& descriptor) {
-    if (descriptor == INTERFACE::descriptor) return this;
+inline sp<IInterface> BnInterface<INTERFACE>::queryLocalInterface(const String16& requested) {
+    if (requested == INTERFACE::descriptor) return this;
     return nullptr;
 }
 
@@ -70,30 +70,30 @@ inline IBinder* BpInterface<INTERFACE>::onAsBinder() {
 }  // namespace android
 
 // In the public part of the class I<INTERFACE>.
-#define DECLARE_META_INTERFACE(INTERFACE)                                                              \
-    static const ::android::String16 descriptor;                                                       \
-    static ::android::sp<I##INTERFACE> asInterface(const ::android::sp<::android::IBinder>& obj);      \
-    virtual const ::android::String16& getInterfaceDescriptor() const;                                 \
-    I##INTERFACE();                                                                                    \
+#define DECLARE_META_INTERFACE(INTERFACE)                                                         \
+    static const ::android::String16 descriptor;                                                  \
+    static ::android::sp<I##INTERFACE> asInterface(const ::android::sp<::android::IBinder>& obj); \
+    virtual const ::android::String16& getInterfaceDescriptor() const;                            \
+    I##INTERFACE();                                                                               \
     virtual ~I##INTERFACE();
 
 // In the source file that defines the proxy, Bp<INTERFACE>, in the namespace of both.
-#define IMPLEMENT_META_INTERFACE(INTERFACE, NAME)                                                       \
-    const ::android::String16 I##INTERFACE::descriptor(NAME);                                           \
-    const ::android::String16& I##INTERFACE::getInterfaceDescriptor() const { return descriptor; }      \
+#define IMPLEMENT_META_INTERFACE(INTERFACE, NAME)                                                         \
+    const ::android::String16 I##INTERFACE::descriptor(NAME);                                             \
+    const ::android::String16& I##INTERFACE::getInterfaceDescriptor() const { return descriptor; }        \
     ::android::sp<I##INTERFACE> I##INTERFACE::asInterface(const ::android::sp<::android::IBinder>& obj) { \
-        if (obj == nullptr) return nullptr;                                                             \
-        const ::android::sp<::android::IInterface> local = obj->queryLocalInterface(descriptor);        \
-        if (local != nullptr) return static_cast<I##INTERFACE*>(local.get());                           \
-        return new Bp##INTERFACE(obj);                                                                  \
-    }                                                                                                   \
-    I##INTERFACE::I##INTERFACE() {}                                                                     \
+        if (obj == nullptr) return nullptr;                                                               \
+        const ::android::sp<::android::IInterface> local = obj->queryLocalInterface(descriptor);          \
+        if (local != nullptr) return static_cast<I##INTERFACE*>(local.get());                             \
+        return new Bp##INTERFACE(obj);                                                                    \
+    }                                                                                                     \
+    I##INTERFACE::I##INTERFACE() {}                                                                       \
     I##INTERFACE::~I##INTERFACE() {}
 
 // In onTransact, before anything is read.
-#define CHECK_INTERFACE(interface, data, reply) \
-    do {                                        \
-        if (!(data).checkInterface(this)) {     \
+#define CHECK_INTERFACE(interface, data, reply)  \
+    do {                                         \
+        if (!(data).checkInterface(this)) {      \
             return ::android::PERMISSION_DENIED; \
-        }                                       \
+        }                                        \
     } while (false)

@@ -22,8 +22,8 @@ public:
 
     // The heap's descriptor, which stays the heap's; -1 when it has none.
     virtual int getHeapID() const = 0;
-    // Where this process sees the heap, MAP_FAILED when it does not. A heap of another process is mapped by the first of
-    // these calls, once for all its references, and stays where it is until the last of them goes.
+    // Where this process sees the heap, MAP_FAILED when it does not. A heap of another process is mapped by the first
+    // of these calls, once for all its references, and stays where it is until the last of them goes.
     virtual void* getBase() const = 0;
     virtual size_t getSize() const = 0;
     virtual uint32_t getFlags() const = 0;

@@ -42,7 +42,7 @@ public:
     // Bytes from the position to the end.
     size_t dataAvail() const { return mDataPos < mDataSize ? mDataSize - mDataPos : 0; }
     size_t dataPosition() const { return mDataPos; }
-    size_t dataCapacity() const { return mCapacity; }
+    size_t dataCapacity() const { return mRelease != nullptr ? mDataSize : mCapacity; }
 
     // New bytes are zero. Objects that no longer fit in are dropped.
     status_t setDataSize(size_t size);
@@ -89,7 +89,8 @@ public:
     status_t writeInt32Array(size_t len, const int32_t* val);
     status_t writeByteArray(size_t len, const uint8_t* val);
     status_t writeStrongBinder(const sp<IBinder>& val);
-    // The descriptor must stay open until the parcel was sent; with takeOwnership the parcel closes it.
+    // The descriptor must stay open until the parcel was sent; with takeOwnership the parcel closes it, unless
+    // the write failed. An invalid one can be written, but not sent.
     status_t writeFileDescriptor(int fd, bool takeOwnership = false);
     // Writes a duplicate, close-on-exec, that the parcel closes.
     status_t writeDupFileDescriptor(int fd);
@@ -155,12 +156,10 @@ private:
 
     // Parcel.cpp: the buffer.
     status_t fail(status_t status);
-    uint8_t* growFor(size_t len);
     uint8_t* place(size_t len);
-    status_t reallocate(size_t capacity);
+    bool makeRoom(size_t end);
+    status_t reserve(size_t capacity);
     status_t makeOwn();
-    void swap(Parcel& other);
-    void reset();
 
     // ParcelValues.cpp
     template <typename T>
@@ -170,17 +169,19 @@ private:
     template <typename T>
     T readOrZero() const;
     status_t writeArray(size_t len, const void* values, size_t size);
+    const void* readTerminated(size_t units, size_t unitSize) const;
 
     // ParcelObjects.cpp
-    status_t writeObject(const flat_binder_object& object, const sp<IBinder>& held);
-    status_t adoptObject(const flat_binder_object& object, size_t offset);
+    status_t writeObject(const flat_binder_object& object);
+    status_t adoptObjects(const Parcel& from, size_t start, size_t len, size_t to);
     bool readObject(flat_binder_object* object) const;
     bool isListed(size_t offset) const;
+    flat_binder_object objectAt(size_t offset) const;
     void dropObjects(size_t start, size_t end);
-    void closeOwnedDescriptors();
 
     uint8_t* mData = nullptr;
     size_t mDataSize = 0;
+    // Of the parcel's own buffer; 0 for a received one.
     size_t mCapacity = 0;
     mutable size_t mDataPos = 0;
     status_t mError = NO_ERROR;

@@ -1,0 +1,42 @@
+#include <binder/IMemory.h>
+#include <binder/Parcel.h>
+
+#include <cstdint>
+#include <memory>
+
+#include "RemoteHeap.h"
+
+namespace android {
+
+class BpMemoryHeap : public BpInterface<IMemoryHeap> {
+public:
+    explicit BpMemoryHeap(const sp<IBinder>& remote)
+        : BpInterface<IMemoryHeap>(remote), mHeap(RemoteHeap::of(remote)) {}
+
+    int getHeapID() const override { return mHeap->mapping().fd; }
+    void* getBase() const override { return mHeap->mapping().base; }
+    size_t getSize() const override { return mHeap->mapping().size; }
+    uint32_t getFlags() const override { return mHeap->mapping().flags; }
+    uint32_t getOffset() const override { return mHeap->mapping().offset; }
+
+private:
+    const std::shared_ptr<RemoteHeap> mHeap;
+};
+
+IMPLEMENT_META_INTERFACE(MemoryHeap, "android.utils.IMemoryHeap")
+
+BnMemoryHeap::BnMemoryHeap() = default;
+BnMemoryHeap::~BnMemoryHeap() = default;
+
+status_t BnMemoryHeap::onTransact(uint32_t code, const Parcel& data, Parcel* reply, uint32_t flags) {
+    if (code != HEAP_ID) return BBinder::onTransact(code, data, reply, flags);
+    CHECK_INTERFACE(IMemoryHeap, data, reply);
+    const size_t size = getSize();
+    if (size > UINT32_MAX) return BAD_VALUE;
+    reply->writeFileDescriptor(getHeapID());
+    reply->writeUint32(static_cast<uint32_t>(size));
+    reply->writeUint32(getFlags());
+    return reply->writeUint32(getOffset());
+}
+
+}  // namespace android
