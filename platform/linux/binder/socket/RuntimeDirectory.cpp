@@ -1,0 +1,139 @@
+#include "RuntimeDirectory.h"
+
+#include <android/log.h>
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/random.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+
+namespace android::socket_driver {
+namespace {
+
+constexpr char kLogTag[] = "BinderSocket";
+constexpr size_t kMaxNameLength = 127;
+constexpr int kBacklog = 128;
+
+// A path that everybody on the machine can create must be checked to be this user's before it is used.
+struct Place {
+    std::string path;
+    bool shared;
+};
+
+Place choosePlace() {
+    const char* chosen = getenv("BINDER_RUNTIME_DIR");
+    if (chosen != nullptr && *chosen != '\0') return {chosen, false};
+    const char* session = getenv("XDG_RUNTIME_DIR");
+    if (session != nullptr && *session != '\0') return {std::string(session) + "/binder", false};
+    return {"/tmp/binder-" + std::to_string(geteuid()), true};
+}
+
+// Paths of what is open already are short, however long the directory's own path is.
+std::string pathOf(int fd) { return "/proc/self/fd/" + std::to_string(fd); }
+
+sockaddr_un addressOf(const std::string& path) {
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    path.copy(address.sun_path, sizeof address.sun_path - 1);
+    return address;
+}
+
+}  // namespace
+
+status_t RuntimeDirectory::open(RuntimeDirectory& directory) {
+    const Place place = choosePlace();
+    if (mkdir(place.path.c_str(), 0700) != 0 && errno != EEXIST) {
+        __android_log_print(ANDROID_LOG_ERROR, kLogTag, "cannot make %s: %s", place.path.c_str(), strerror(errno));
+        return -errno;
+    }
+    UniqueFd fd(::open(place.path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC | (place.shared ? O_NOFOLLOW : 0)));
+    struct stat status {};
+    if (!fd.valid() || fstat(fd.get(), &status) != 0) {
+        __android_log_print(ANDROID_LOG_ERROR, kLogTag, "cannot open %s: %s", place.path.c_str(), strerror(errno));
+        return -errno;
+    }
+    if (place.shared && (status.st_uid != geteuid() || (status.st_mode & 077) != 0)) {
+        __android_log_print(ANDROID_LOG_ERROR, kLogTag, "%s is open to other users: not used", place.path.c_str());
+        return PERMISSION_DENIED;
+    }
+    directory.directory_ = std::move(fd);
+    return OK;
+}
+
+bool RuntimeDirectory::isValidName(const std::string& name) {
+    return !name.empty() && name.size() <= kMaxNameLength && name[0] != '.' && name.find('/') == std::string::npos &&
+           name.find('\0') == std::string::npos;
+}
+
+status_t RuntimeDirectory::publish(const std::string& name, UniqueFd& listener, FileId& id) const {
+    unsigned long long random = 0;
+    if (getrandom(&random, sizeof random, 0) != sizeof random) return -errno;
+    char temporary[32];
+    snprintf(temporary, sizeof temporary, ".%016llx", random);
+
+    const sockaddr_un address = addressOf(pathOf(directory_.get()) + "/" + temporary);
+    UniqueFd fd(socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    if (!fd.valid()) return -errno;
+    if (bind(fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) return -errno;
+
+    // Who may reach the service is decided by the directory's permissions, not by this process's file mask.
+    struct stat status {};
+    const bool ready = fchmodat(directory_.get(), temporary, 0666, 0) == 0 && ::listen(fd.get(), kBacklog) == 0 &&
+                       fstatat(directory_.get(), temporary, &status, AT_SYMLINK_NOFOLLOW) == 0 &&
+                       renameat(directory_.get(), temporary, directory_.get(), name.c_str()) == 0;
+    if (!ready) {
+        const status_t error = -errno;
+        unlinkat(directory_.get(), temporary, 0);
+        return error;
+    }
+    id = {status.st_dev, status.st_ino};
+    listener = std::move(fd);
+    return OK;
+}
+
+status_t RuntimeDirectory::connect(const std::string& name, UniqueFd& connection) const {
+    // By way of a descriptor: a name may be longer than an address holds.
+    const UniqueFd file(openat(directory_.get(), name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
+    if (!file.valid()) return errno == ENOENT ? NAME_NOT_FOUND : -errno;
+    const sockaddr_un address = addressOf(pathOf(file.get()));
+    UniqueFd fd(socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0));
+    if (!fd.valid()) return -errno;
+    int result = -1;
+    do {
+        result = ::connect(fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
+    } while (result != 0 && errno == EINTR);
+    if (result != 0) return errno == ENOENT || errno == ECONNREFUSED ? NAME_NOT_FOUND : -errno;
+    connection = std::move(fd);
+    return OK;
+}
+
+bool RuntimeDirectory::identify(const std::string& name, FileId& id) const {
+    struct stat status {};
+    if (fstatat(directory_.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0 || !S_ISSOCK(status.st_mode)) {
+        return false;
+    }
+    id = {status.st_dev, status.st_ino};
+    return true;
+}
+
+std::vector<std::string> RuntimeDirectory::list() const {
+    std::vector<std::string> names;
+    const std::unique_ptr<DIR, int (*)(DIR*)> entries(opendir(pathOf(directory_.get()).c_str()), closedir);
+    if (entries == nullptr) return names;
+    while (const dirent* entry = readdir(entries.get())) {
+        FileId id;
+        if (isValidName(entry->d_name) && identify(entry->d_name, id)) names.emplace_back(entry->d_name);
+    }
+    std::sort(names.begin(), names.end());
+    return names;
+}
+
+}  // namespace android::socket_driver
