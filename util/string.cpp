@@ -10,7 +10,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <initializer_list>
 
 #include "log/module_log.h"
 
@@ -21,13 +20,10 @@ constexpr char kTag[] = "OSAL_STRING";
 // The shape of the functions that refuse null texts: a null is logged and answered with null or 0, everything
 // else with what the C library answers.
 template <typename Call>
-auto unless_null(std::initializer_list<const void*> pointers, Call call, int line = __builtin_LINE())
-    -> decltype(call()) {
-    if (std::find(pointers.begin(), pointers.end(), nullptr) != pointers.end()) {
-        TAVO_LOG_AT(line, kTag, TAVO_LOG_ERROR, "Invalid parameter\n");
-        return {};
-    }
-    return call();
+auto when_given(bool given, Call call, int line = __builtin_LINE()) -> decltype(call()) {
+    if (given) return call();
+    TAVO_LOG_AT(line, kTag, TAVO_LOG_ERROR, "Invalid parameter\n");
+    return {};
 }
 
 // The shape of the comparisons: a null text is logged and compares like an empty one. The other text's first byte
@@ -58,39 +54,39 @@ long strtol_32(const char* text, const char*& end, int base) {
 }  // namespace
 
 char* tavo_osal_string_copy(char* pcDst, const char* pcSrc) {
-    return unless_null({pcDst, pcSrc}, [=] { return strcpy(pcDst, pcSrc); });
+    return when_given(pcDst && pcSrc, [=] { return strcpy(pcDst, pcSrc); });
 }
 
 char* tavo_osal_string_num_copy(char* pcDst, const char* pcSrc, unsigned int uiCount) {
-    return unless_null({pcDst, pcSrc}, [=] { return strncpy(pcDst, pcSrc, uiCount); });
+    return when_given(pcDst && pcSrc, [=] { return strncpy(pcDst, pcSrc, uiCount); });
 }
 
 char* tavo_osal_string_concatenate(char* pcDst, const char* pcSrc) {
-    return unless_null({pcDst, pcSrc}, [=] { return strcat(pcDst, pcSrc); });
+    return when_given(pcDst && pcSrc, [=] { return strcat(pcDst, pcSrc); });
 }
 
 char* tavo_osal_string_num_concatenate(char* pcDst, const char* pcSrc, unsigned int uiCount) {
-    return unless_null({pcDst, pcSrc}, [=] { return strncat(pcDst, pcSrc, uiCount); });
+    return when_given(pcDst && pcSrc, [=] { return strncat(pcDst, pcSrc, uiCount); });
 }
 
 char* tavo_osal_string_duplicate_string(char* pcStr) {
-    return unless_null({pcStr}, [=] { return strdup(pcStr); });
+    return when_given(pcStr, [=] { return strdup(pcStr); });
 }
 
 unsigned int tavo_osal_string_get_length(const char* pcStr) {
-    return unless_null({pcStr}, [=] { return static_cast<unsigned int>(strlen(pcStr)); });
+    return when_given(pcStr, [=] { return static_cast<unsigned int>(strlen(pcStr)); });
 }
 
 char* tavo_osal_string_search_string(char* pcHaystack, const char* pcNeedle) {
-    return unless_null({pcHaystack, pcNeedle}, [=] { return strstr(pcHaystack, pcNeedle); });
+    return when_given(pcHaystack && pcNeedle, [=] { return strstr(pcHaystack, pcNeedle); });
 }
 
 char* tavo_osal_string_search_character(char* pcStr, int iChar) {
-    return unless_null({pcStr}, [=] { return strchr(pcStr, iChar); });
+    return when_given(pcStr, [=] { return strchr(pcStr, iChar); });
 }
 
 char* tavo_osal_string_search_last_character(char* pcStr, int iChar) {
-    return unless_null({pcStr}, [=] { return strrchr(pcStr, iChar); });
+    return when_given(pcStr, [=] { return strrchr(pcStr, iChar); });
 }
 
 // Both names are part of the interface.
