@@ -9,5 +9,6 @@
 #include "tavo_osal/log.h"
 #include "tavo_osal/memory.h"
 #include "tavo_osal/status.h"
+#include "tavo_osal/string.h"
 
 #endif

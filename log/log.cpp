@@ -102,9 +102,13 @@ bool apply_modules(const char* list, bool& cleared) {
 }
 
 void apply_file_name(const char* name) {
-    if (snprintf(g_acFilePath, sizeof g_acFilePath, "%s%s%s", "/tmp/", name, ".txt") < 0) {
+    TAVO_CHAR path[sizeof g_acFilePath] = {};
+    if (snprintf(path, sizeof path, "%s%s%s", "/tmp/", name, ".txt") < 0) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "snprintf failed.\n");
+        return;
     }
+    // The whole path has no single exchange; byte by byte, two setters at once mix names but never race.
+    for (size_t i = 0; i < sizeof path; ++i) store(g_acFilePath[i], path[i]);
 }
 
 // Splits the preference in place and applies it from left to right.
@@ -165,16 +169,22 @@ void tavo_print_log(uint32_t uiLevel, uint32_t uiModule, int iLine, const TAVO_C
 }
 
 void tavo_set_log_preference(const TAVO_CHAR* pcLogPreference, TAVO_LogCallback fpCallback, void* pvParam) {
-    if (__atomic_load_n(&g_uiEnvValueRead, __ATOMIC_SEQ_CST) == 1) {
+    // Of several threads that find LOG_PREF at once, the one that sets the latch takes its value: it is split in
+    // place, which two threads must not do to one string.
+    char* preference = nullptr;
+    bool consumed = __atomic_load_n(&g_uiEnvValueRead, __ATOMIC_SEQ_CST) == 1;
+    if (!consumed) {
+        preference = getenv("LOG_PREF");
+        if (preference != nullptr) consumed = __atomic_exchange_n(&g_uiEnvValueRead, 1U, __ATOMIC_SEQ_CST) == 1;
+    }
+    if (consumed) {
         printf("g_uiEnvValueRead var read and use already set pref");
         return;
     }
 
     char* copy = nullptr;
-    char* preference = getenv("LOG_PREF");
     if (preference != nullptr) {
         printf("Environment variable LOG_PREF is %s\n", preference);
-        store(g_uiEnvValueRead, 1U);
     } else {
         printf("No preferences received from env LOG_PREF ");
         if (pcLogPreference == nullptr) {
