@@ -64,8 +64,7 @@ const RemoteHeap::Mapping& RemoteHeap::mapping() {
     Mapping mapping;
     const status_t status = ask(&mapping);
     if (status != NO_ERROR) {
-        __android_log_print(ANDROID_LOG_ERROR, kTag, "A heap of another process could not be mapped: %s",
-                            statusToString(status).c_str());
+        __android_log_print(ANDROID_LOG_ERROR, kTag, "A heap of another process could not be mapped: %d", status);
         if (mapping.fd >= 0) close(mapping.fd);
         return kNoMapping;
     }
