@@ -8,6 +8,8 @@
 #include "tavo_osal/list.h"
 #include "tavo_osal/log.h"
 #include "tavo_osal/memory.h"
+#include "tavo_osal/network.h"
+#include "tavo_osal/socket.h"
 #include "tavo_osal/status.h"
 #include "tavo_osal/string.h"
 
