@@ -18,7 +18,7 @@ constexpr char kTag[] = "OSAL_SOCKET";
 // carry the line of the wrapper, not of this function.
 inline bool failed(long result, const char* message, int line = __builtin_LINE()) {
     if (__builtin_expect(result >= 0, 1)) return false;
-    if (log_enabled(TAVO_LOG_ERROR)) tavo_print_log(TAVO_LOG_ERROR, 0, line, kTag, message, errno);
+    TAVO_LOG_AT(line, kTag, TAVO_LOG_ERROR, message, errno);
     return true;
 }
 
@@ -30,16 +30,14 @@ inline TAVO_Status status_of(long result, TAVO_Status code, const char* message,
 // True, and logged, when a pointer is null that must not be.
 inline bool missing(const void* pointer, int line = __builtin_LINE()) {
     if (pointer != nullptr) return false;
-    if (log_enabled(TAVO_LOG_ERROR)) tavo_print_log(TAVO_LOG_ERROR, 0, line, kTag, "Invalid parameter\n");
+    TAVO_LOG_AT(line, kTag, TAVO_LOG_ERROR, "Invalid parameter\n");
     return true;
 }
 
 // True, and logged, when a descriptor cannot be a socket's: negative, or 0, which callers use for "none".
 inline bool invalid_descriptor(int descriptor, int line = __builtin_LINE()) {
     if (descriptor > 0) return false;
-    if (log_enabled(TAVO_LOG_ERROR)) {
-        tavo_print_log(TAVO_LOG_ERROR, 0, line, kTag, "Invalid socket fd:%d\n", descriptor);
-    }
+    TAVO_LOG_AT(line, kTag, TAVO_LOG_ERROR, "Invalid socket fd:%d\n", descriptor);
     return true;
 }
 
