@@ -33,10 +33,11 @@ namespace tavo {
 // A function's entry and exit in the trace.
 class ScopeTrace {
 public:
-    ScopeTrace(const char* tag, int line) : tag_(tag), line_(line) {
-        TAVO_LOG_AT(line_, tag_, TAVO_LOG_TRACE, "++Entered\n");
+    ScopeTrace(const char* tag, int line, const char* entered) : tag_(tag), line_(line) {
+        TAVO_LOG_AT(line_, tag_, TAVO_LOG_TRACE, "%s", entered);
     }
-    ~ScopeTrace() { TAVO_LOG_AT(line_, tag_, TAVO_LOG_TRACE, "--Exiting\n"); }
+    // A thread may be cancelled, which unwinds its stack, while it writes the log.
+    ~ScopeTrace() noexcept(false) { TAVO_LOG_AT(line_, tag_, TAVO_LOG_TRACE, "--Exiting\n"); }
     ScopeTrace(const ScopeTrace&) = delete;
     ScopeTrace& operator=(const ScopeTrace&) = delete;
 
@@ -48,4 +49,6 @@ private:
 }  // namespace tavo
 
 // "++Entered" here and "--Exiting" wherever the function is left.
-#define TAVO_TRACE_SCOPE(tag) const tavo::ScopeTrace scope_trace((tag), __LINE__)
+#define TAVO_TRACE_SCOPE(tag) TAVO_TRACE_SCOPE_AS(tag, "++Entered\n")
+// For a function that says it entered in words of its own.
+#define TAVO_TRACE_SCOPE_AS(tag, entered) const tavo::ScopeTrace scope_trace((tag), __LINE__, (entered))

@@ -16,6 +16,9 @@
 /** Part of the library's binary interface. */
 #define TAVO_API __attribute__((visibility("default")))
 
+/** Not part of it, although a member of something that is. */
+#define TAVO_LOCAL __attribute__((visibility("hidden")))
+
 /** Argument number @p fmt is a printf format whose values start at argument number @p first. */
 #define TAVO_PRINTF(fmt, first) __attribute__((format(printf, fmt, first)))
 
