@@ -5,9 +5,12 @@
 #ifndef TAVO_OSAL_H
 #define TAVO_OSAL_H
 
+#include "tavo_osal/dl.h"
+#include "tavo_osal/file.h"
 #include "tavo_osal/list.h"
 #include "tavo_osal/log.h"
 #include "tavo_osal/memory.h"
+#include "tavo_osal/process.h"
 #include "tavo_osal/status.h"
 #include "tavo_osal/string.h"
 
