@@ -122,11 +122,16 @@ TEST_F(Exec, SucceedsForAProgramThatCannotBeRunWhichTheGrandchildTells) {
 TEST_F(Exec, PrintsBufferedOutputOnce) {
     OutputCapture output;
     printf("before\n");
+    FILE* file = fopen(kResult, "we");
+    ASSERT_NE(file, nullptr);
+    fputs("buffered\n", file);
     EXPECT_EQ(tavo_osal_exec(kMissing, "name", nullptr), TAVO_SUCCESS);
     EXPECT_EQ(tavo_osal_exec("/bin/true", "true", nullptr), TAVO_SUCCESS);
     reap();
     reap();
     printf("after\n");
+    fclose(file);
+    EXPECT_EQ(contents_of(kResult), "buffered\n");
     const std::string text = output.finish();
     for (const char* once : {"before\n", "execl failed. so exiting the child\n", "after\n"}) {
         const size_t first = text.find(once);
