@@ -8,7 +8,6 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <utility>
@@ -257,6 +256,8 @@ void LoopbackDriver::joinThreadPool(bool isMain) {
     joined_.notify_all();
 }
 
-void LoopbackDriver::quiesce() { puts("quiesced"); }
+void LoopbackDriver::quiesce() {
+    if (on_quiesce != nullptr) on_quiesce();
+}
 
 }  // namespace tavo::test

@@ -173,6 +173,7 @@ private:
 
     // ParcelObjects.cpp
     status_t writeObject(const flat_binder_object& object);
+    void listObject(size_t offset);
     status_t adoptObjects(const Parcel& from, size_t start, size_t len, size_t to);
     bool readObject(flat_binder_object* object) const;
     bool isListed(size_t offset) const;
