@@ -135,14 +135,15 @@ status_t Parcel::writeInt32Array(size_t len, const int32_t* val) { return writeA
 status_t Parcel::writeByteArray(size_t len, const uint8_t* val) { return writeArray(len, val, sizeof *val); }
 
 status_t Parcel::read(void* outData, size_t len) const {
+    if (len == 0) return NO_ERROR;
     const void* bytes = readInplace(len);
     if (bytes == nullptr) return NOT_ENOUGH_DATA;
-    if (len != 0) memcpy(outData, bytes, len);
+    memcpy(outData, bytes, len);
     return NO_ERROR;
 }
 
 const void* Parcel::readInplace(size_t len) const {
-    if (len > kMaxSize || padded(len) > dataAvail()) return nullptr;
+    if (mDataPos > mDataSize || len > kMaxSize || padded(len) > dataAvail()) return nullptr;
     const void* bytes = mData + mDataPos;
     mDataPos += padded(len);
     return bytes;

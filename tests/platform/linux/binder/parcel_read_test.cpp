@@ -83,6 +83,17 @@ TEST(ParcelRead, OfABlockBeyondTheEndFailsAndStays) {
     EXPECT_EQ(parcel->read(nullptr, 0), NO_ERROR);
 }
 
+TEST(ParcelRead, BehindTheEndFindsNothing) {
+    Parcel parcel;
+    parcel.setDataPosition(INT32_MAX);
+    EXPECT_EQ(parcel.readInplace(0), nullptr);
+    EXPECT_EQ(parcel.read(nullptr, 0), NO_ERROR);
+    EXPECT_EQ(parcel.readInt32(), 0);
+    EXPECT_EQ(parcel.readCString(), nullptr);
+    EXPECT_EQ(parcel.readString16(), String16());
+    EXPECT_EQ(parcel.readStrongBinder(), nullptr);
+}
+
 TEST(ParcelRead, OfABlockWhosePaddingIsMissingFails) {
     const Received parcel({1, 2, 3, 4, 5});
     uint8_t block[5];
