@@ -28,6 +28,11 @@ private:
     std::atomic<int>& sum_;
 };
 
+struct Named : public RefBase {
+    explicit Named(const String16& text) : name(text) {}
+    const String16 name;
+};
+
 TEST(ReferenceCount, OrdersUseOnAnyThreadBeforeDestructionOnAnother) {
     constexpr int kRounds = 300;
     std::atomic<int> sum{0};
@@ -61,6 +66,21 @@ TEST(ReferenceCount, OrdersUseBeforeDestructionWhenAWeakReferenceIsPromoted) {
         user.join();
     }
     EXPECT_LE(sum, 200);
+}
+
+TEST(ReferenceCount, OrdersTheReadersOfACopiedStringBeforeItGoes) {
+    for (int r = 0; r < 200; ++r) {
+        sp<Named> object = new Named(String16("a text of its own"));
+        std::vector<std::thread> threads;
+        for (size_t i = 0; i < 3; ++i) {
+            threads.emplace_back([copy = object->name]() mutable {
+                EXPECT_EQ(copy.string()[2], u't');
+                copy.setTo(String16());
+            });
+        }
+        object.clear();
+        for (std::thread& thread : threads) thread.join();
+    }
 }
 
 TEST(ReferenceCount, OrdersProxiesThatComeAndGo) {
