@@ -227,6 +227,14 @@ String16 Parcel::readString16() const {
     return text != nullptr ? String16(text, length) : String16();
 }
 
+status_t Parcel::readString16(String16* pArg) const {
+    const size_t position = mDataPos;
+    size_t length = 0;
+    const char16_t* text = readString16Inplace(&length);
+    if (text != nullptr) return pArg->setTo(text, length);
+    return mDataPos != position ? UNEXPECTED_NULL : NOT_ENOUGH_DATA;
+}
+
 const char16_t* Parcel::readString16Inplace(size_t* outLen) const {
     const size_t position = mDataPos;
     *outLen = 0;

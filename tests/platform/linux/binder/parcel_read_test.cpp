@@ -129,6 +129,17 @@ TEST(ParcelRead, OfANullString16MovesOn) {
     EXPECT_EQ(parcel->readInt32(), 5);
 }
 
+TEST(ParcelRead, OfAString16TellsItsStatus) {
+    const Received parcel(words({1, 0x00000041, -1, 1, 0x00420041}));
+    String16 text;
+    EXPECT_EQ(parcel->readString16(&text), NO_ERROR);
+    EXPECT_EQ(text, String16("A"));
+    EXPECT_EQ(parcel->readString16(&text), UNEXPECTED_NULL);
+    EXPECT_EQ(parcel->readString16(&text), NOT_ENOUGH_DATA);
+    EXPECT_EQ(text, String16("A"));
+    EXPECT_EQ(parcel->dataPosition(), 12U);
+}
+
 TEST(ParcelRead, OfAString16AtAnOddAddressFails) {
     const Received parcel({0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0});
     parcel->setDataPosition(1);

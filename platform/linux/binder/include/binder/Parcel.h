@@ -125,6 +125,8 @@ public:
     // Empty on failure.
     String8 readString8() const;
     String16 readString16() const;
+    // UNEXPECTED_NULL for a null string.
+    status_t readString16(String16* pArg) const;
     // Terminated; null for a null string and on failure.
     const char16_t* readString16Inplace(size_t* outLen) const;
     // Null on failure.
