@@ -180,6 +180,8 @@ TEST(InterfaceState, WritesTheOtherFlagsBackAsRead) {
     }
 }
 
+std::string bytes_of(const ifreq& request) { return {reinterpret_cast<const char*>(&request), sizeof request}; }
+
 TEST(InterfaceState, ClearsTheRequestAndCopiesSixteenBytesAtMost) {
     const PlatformHook hook(kLibrary, "ioctl", answer_request);
     g_readable = true;
@@ -189,10 +191,10 @@ TEST(InterfaceState, ClearsTheRequestAndCopiesSixteenBytesAtMost) {
     ASSERT_EQ(g_requests.size(), 4U);
     ifreq expected = {};
     memcpy(expected.ifr_name, "0123456789abcdef", 16);
-    EXPECT_EQ(memcmp(&g_requests[0].request, &expected, sizeof expected), 0);
+    EXPECT_EQ(bytes_of(g_requests[0].request), bytes_of(expected));
     expected = {};
     expected.ifr_name[0] = 'w';
-    EXPECT_EQ(memcmp(&g_requests[2].request, &expected, sizeof expected), 0);
+    EXPECT_EQ(bytes_of(g_requests[2].request), bytes_of(expected));
 }
 
 TEST(InterfaceState, WritesNothingWhenTheFlagsCannotBeRead) {
