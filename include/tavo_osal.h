@@ -11,6 +11,7 @@
 #include "tavo_osal/log.h"
 #include "tavo_osal/memory.h"
 #include "tavo_osal/msg_queue.h"
+#include "tavo_osal/msg_queue_key.h"
 #include "tavo_osal/network.h"
 #include "tavo_osal/shared_memory.h"
 #include "tavo_osal/socket.h"
