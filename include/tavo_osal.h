@@ -15,6 +15,12 @@
 #include "tavo_osal/network.h"
 #include "tavo_osal/shared_memory.h"
 #include "tavo_osal/socket.h"
+#include "tavo_osal/dl.h"
+#include "tavo_osal/file.h"
+#include "tavo_osal/list.h"
+#include "tavo_osal/log.h"
+#include "tavo_osal/memory.h"
+#include "tavo_osal/process.h"
 #include "tavo_osal/status.h"
 #include "tavo_osal/string.h"
 

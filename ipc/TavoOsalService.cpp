@@ -74,8 +74,9 @@ int TavoOsalService::TavoOsalServiceInit(unsigned int uiMaxNumMsgQueues, unsigne
         return TAVO_SUCCESS;
     }
     // Deliberately as much as whole records would take, although an entry is one pointer.
-    if (uiMaxNumMsgQueues <= SIZE_MAX / sizeof(KeyRecord)) {
-        m_ppQueues = static_cast<KeyRecord**>(malloc(uiMaxNumMsgQueues * sizeof(KeyRecord)));
+    size_t bytes = 0;
+    if (!__builtin_mul_overflow(uiMaxNumMsgQueues, sizeof(KeyRecord), &bytes)) {
+        m_ppQueues = static_cast<KeyRecord**>(malloc(bytes));
     }
     if (m_ppQueues == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "Memory allocation failed !!!\n");

@@ -64,19 +64,17 @@ bool passes(uint32_t level, uint32_t module) {
     return passed && (level != TAVO_LOG_PERFORMANCE || load(g_uiPerformance) != 0);
 }
 
-// The decimal number that text begins with; false when text is not wholly a number.
-bool parse_number(const char* text, long& number) {
+// The decimal number that text is; 0, and a logged error, when it is none.
+long parse_number(const char* text) {
     char* end = nullptr;
-    number = strtol(text, &end, 10);
-    if (*end == '\0') return true;
+    const long number = strtol(text, &end, 10);
+    if (*end == '\0') return number;
     TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid string is passed. string = %s.\n", text);
-    number = 0;
-    return false;
+    return 0;
 }
 
 void apply_level(const char* text) {
-    long level = 0;
-    parse_number(text, level);
+    const long level = parse_number(text);
     if (level >= 0 && level <= static_cast<long>(kHighestLevel)) {
         store(g_uiMxEnabledLogLevel, static_cast<uint32_t>(level));
     }
@@ -91,8 +89,8 @@ bool apply_modules(const char* list, bool& cleared) {
     }
     char* rest = nullptr;
     for (char* item = strtok_r(copy, ",", &rest); item != nullptr; item = strtok_r(nullptr, ",", &rest)) {
-        long module = 0;
-        if (!parse_number(item, module) || module < 1 || module > static_cast<long>(kModuleCount)) continue;
+        const long module = parse_number(item);
+        if (module < 1 || module > static_cast<long>(kModuleCount)) continue;
         if (!cleared) store(g_uiEnabledModuleMask, 0U);
         cleared = true;
         __atomic_fetch_or(&g_uiEnabledModuleMask, 1U << (module - 1), __ATOMIC_SEQ_CST);

@@ -25,6 +25,9 @@
 /** Argument number @p fmt is a scanf format whose targets start at argument number @p first. */
 #define TAVO_SCANF(fmt, first) __attribute__((format(scanf, fmt, first)))
 
+/** The arguments end with a null pointer. */
+#define TAVO_SENTINEL __attribute__((sentinel))
+
 /** The result carries the only news of a failure or the only reference to a resource. */
 #define TAVO_CHECK_RESULT __attribute__((warn_unused_result))
 

@@ -317,7 +317,7 @@ TEST_F(LogPreferenceAllocations, DropsTheRestWhenAModuleListCannotBeCopied) {
 }
 
 TEST_F(LogPreferenceAllocations, FreesItsCopiesAndNothingElse) {
-    apply("-m1 -m2 name -l3");
+    apply("-m1 -m2 -m name -l3");  // a bare -m has no list to copy
     EXPECT_EQ(g_copies_until_failure, -1 - 3);
     EXPECT_TRUE(g_copies.empty());
 

@@ -223,11 +223,17 @@ TEST_F(PrintLog, PreservesErrnoWhateverTheLogDoesWithIt) {
 }
 
 TEST_F(PrintLog, ExpandsThePercentMOfTheCallersErrno) {
+    const PlatformHook hook(
+        "libtavoosal.so", "gettimeofday", +[](timeval*, void*) {
+            errno = EIO;
+            return -1;
+        });
     const LogCapture log;
+    g_uiPerformance = 1;
     errno = ENOENT;
-    tavo_print_log(1, 0, 1, "TAG", "%m");
+    tavo_print_log(0, 0, 1, "TAG", "%m");
     ASSERT_EQ(log.lines().size(), 1U);
-    EXPECT_EQ(log.lines()[0].text, std::string("1::") + strerror(ENOENT));
+    EXPECT_EQ(log.lines()[0].text, std::string("0 ::1::") + strerror(ENOENT));
 }
 
 // The filter in front of the library's own messages, level by level, which must agree with the writer's.

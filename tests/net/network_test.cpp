@@ -10,6 +10,7 @@
 #include <cstdarg>
 #include <cstring>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "net/private_network.h"
@@ -109,10 +110,12 @@ TEST(InterfaceState, ReportsADescriptorThatIsNotOpen) {
 TEST(InterfaceState, ReportsThatTheFlagsMayNotBeWritten) {
     TAVO_ENTER_PRIVATE_NETWORK();
     const Descriptor fd = make_socket(AF_INET, SOCK_DGRAM);
-    tavo::test::give_up_network_rights();
     const LogCapture log;
-    EXPECT_EQ(tavo_osal_socket_set_nw_iface_state(fd.get(), "lo", 1), TAVO_FAILURE);
-    EXPECT_EQ(tavo_osal_socket_set_nw_iface_state(fd.get(), "lo", 0), TAVO_FAILURE);
+    std::thread([&] {
+        tavo::test::give_up_network_rights();
+        EXPECT_EQ(tavo_osal_socket_set_nw_iface_state(fd.get(), "lo", 1), TAVO_FAILURE);
+        EXPECT_EQ(tavo_osal_socket_set_nw_iface_state(fd.get(), "lo", 0), TAVO_FAILURE);
+    }).join();
     EXPECT_TRUE(
         logged_exactly(log.lines(), {{1, kTag, "Error in bringing up the n/w interface(lo)(" + error_text(EPERM)},
                                      {1, kTag, "Error in bringing down the n/w interface(lo)(" + error_text(EPERM)}}));
@@ -177,6 +180,8 @@ TEST(InterfaceState, WritesTheOtherFlagsBackAsRead) {
     }
 }
 
+std::string bytes_of(const ifreq& request) { return {reinterpret_cast<const char*>(&request), sizeof request}; }
+
 TEST(InterfaceState, ClearsTheRequestAndCopiesSixteenBytesAtMost) {
     const PlatformHook hook(kLibrary, "ioctl", answer_request);
     g_readable = true;
@@ -186,10 +191,10 @@ TEST(InterfaceState, ClearsTheRequestAndCopiesSixteenBytesAtMost) {
     ASSERT_EQ(g_requests.size(), 4U);
     ifreq expected = {};
     memcpy(expected.ifr_name, "0123456789abcdef", 16);
-    EXPECT_EQ(memcmp(&g_requests[0].request, &expected, sizeof expected), 0);
+    EXPECT_EQ(bytes_of(g_requests[0].request), bytes_of(expected));
     expected = {};
     expected.ifr_name[0] = 'w';
-    EXPECT_EQ(memcmp(&g_requests[2].request, &expected, sizeof expected), 0);
+    EXPECT_EQ(bytes_of(g_requests[2].request), bytes_of(expected));
 }
 
 TEST(InterfaceState, WritesNothingWhenTheFlagsCannotBeRead) {

@@ -1,5 +1,6 @@
 #include "net/private_network.h"
 
+#include <fcntl.h>
 #include <linux/capability.h>
 #include <net/if.h>
 #include <sched.h>
@@ -12,15 +13,14 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "net/sockets.h"
-
 namespace tavo::test {
 
-std::string enter_private_network() {
+PrivateNetwork::PrivateNetwork() : before_(open("/proc/thread-self/ns/net", O_RDONLY | O_CLOEXEC)) {
     // Root needs no user namespace; anybody else has the rights over a network only in one.
-    if (unshare(CLONE_NEWNET) == 0 || unshare(CLONE_NEWUSER | CLONE_NEWNET) == 0) return {};
-    return strerror(errno);
+    if (unshare(CLONE_NEWNET) != 0 && unshare(CLONE_NEWUSER | CLONE_NEWNET) != 0) refusal_ = strerror(errno);
 }
+
+PrivateNetwork::~PrivateNetwork() { setns(before_.get(), CLONE_NEWNET); }
 
 int interface_flags(const char* name) {
     const Descriptor any = make_socket(AF_INET, SOCK_DGRAM);

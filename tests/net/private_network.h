@@ -3,22 +3,37 @@
 
 #include <string>
 
+#include "net/sockets.h"
+
 namespace tavo::test {
 
-// Moves the calling thread, for good, into a network namespace that holds one loopback interface, which is down.
-// The answer is empty, or the reason why this user may not.
-std::string enter_private_network();
+// While it lives, the calling thread is in a new network namespace, which holds one loopback interface that is
+// down. There is no way back for users who may enter one only through a user namespace: their test's process stays.
+class PrivateNetwork {
+public:
+    PrivateNetwork();
+    ~PrivateNetwork();
+    PrivateNetwork(const PrivateNetwork&) = delete;
+    PrivateNetwork& operator=(const PrivateNetwork&) = delete;
+
+    // Why this user may not enter one; empty when the thread is in it.
+    const std::string& refusal() const { return refusal_; }
+
+private:
+    Descriptor before_;
+    std::string refusal_;
+};
 
 // The flags of an interface, IFF_UP and others, read without the library.
 int interface_flags(const char* name);
 
-// Gives up, for the calling thread, the right to configure networks.
+// Gives up, for the calling thread and for good, the right to configure networks.
 void give_up_network_rights();
 
 }  // namespace tavo::test
 
-#define TAVO_ENTER_PRIVATE_NETWORK()                                                               \
-    do {                                                                                           \
-        const std::string reason = tavo::test::enter_private_network();                            \
-        if (!reason.empty()) GTEST_SKIP() << "no network namespace of the test's own: " << reason; \
-    } while (false)
+// Puts the rest of the test into a network of its own.
+#define TAVO_ENTER_PRIVATE_NETWORK()                  \
+    const tavo::test::PrivateNetwork private_network; \
+    if (!private_network.refusal().empty())           \
+    GTEST_SKIP() << "no network namespace of the test's own: " << private_network.refusal()

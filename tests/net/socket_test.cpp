@@ -11,7 +11,6 @@
 #include <cstring>
 #include <string>
 
-#include "net/private_network.h"
 #include "net/sockets.h"
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
@@ -180,10 +179,10 @@ TEST_P(SocketByName, ReportsANameThatIsNotFound) {
 }
 
 TEST_P(SocketByName, LogsTheResolversOwnErrorNumber) {
-    TAVO_ENTER_PRIVATE_NETWORK();  // where no name server can be reached
     const LogCapture log;
+    const std::string name(64, 'n');  // no label is that long, so no name server is asked
     const Descriptor fd = make_socket(AF_INET, SOCK_STREAM);
-    EXPECT_EQ(GetParam().call(fd.get(), "no-such-host.invalid", 1), TAVO_INVALID_PARAM);
+    EXPECT_EQ(GetParam().call(fd.get(), name.c_str(), 1), TAVO_INVALID_PARAM);
     EXPECT_NE(h_errno, 0);
     EXPECT_TRUE(
         logged_exactly(log.lines(), {{1, kTag, "Get host by name failed. Errno: " + to_string(h_errno) + ".\n"}}));

@@ -172,6 +172,19 @@ TEST(UnixBind, FailsForAPathThatIsLongerThanTheAddress) {
     EXPECT_FALSE(called);
 }
 
+TEST(UnixBind, RemovesAFileOfAnyNameInTheFirstCall) {
+    const TemporaryDirectory directory;
+    const std::string path = directory.path_of_length(kLongestPath + 40);
+    std::ofstream(path) << "content";
+    const Descriptor fd = make_socket(AF_UNIX, SOCK_DGRAM);
+    const LogCapture log;
+    EXPECT_EQ(tavo_osal_unix_domain_socket_bind(fd.get(), path.c_str()), TAVO_FAILURE);
+    EXPECT_FALSE(exists(path));
+    EXPECT_EQ(tavo_osal_unix_domain_socket_bind(fd.get(), path.c_str()), TAVO_FAILURE);
+    EXPECT_TRUE(logged_exactly(log.lines(), {{1, kTag, "Unable to unlink pcUnixDomainFilePath.\n"},
+                                             bind_failed_line(fd.get(), ENAMETOOLONG)}));
+}
+
 TEST(UnixBind, RefusesANullPath) {
     const LogCapture log;
     EXPECT_EQ(tavo_osal_unix_domain_socket_bind(7, nullptr), TAVO_INVALID_PARAM);

@@ -8,7 +8,6 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <utility>
@@ -53,11 +52,12 @@ struct LoopbackDriver::Buffer {
 };
 
 LoopbackDriver& LoopbackDriver::open() {
-    if (g_driver == nullptr) {
+    static std::once_flag once;
+    std::call_once(once, [] {
         android::registerDriver("loopback", make_driver);
         setenv("BINDER_DRIVER", "loopback", 1);
         android::ProcessState::self();
-    }
+    });
     return *g_driver;
 }
 
@@ -257,6 +257,8 @@ void LoopbackDriver::joinThreadPool(bool isMain) {
     joined_.notify_all();
 }
 
-void LoopbackDriver::quiesce() { puts("quiesced"); }
+void LoopbackDriver::quiesce() {
+    if (on_quiesce != nullptr) on_quiesce();
+}
 
 }  // namespace tavo::test

@@ -49,6 +49,9 @@ public:
     // Has the process start one more thread, as a driver under load does.
     void ask_for_thread() { process_.spawnPooledThread(); }
 
+    // Called when the process exits.
+    void (*on_quiesce)() = nullptr;
+
     explicit LoopbackDriver(Process& process) : process_(process) {}
     android::status_t transact(int32_t handle, uint32_t code, const android::Parcel& data, android::Parcel* reply,
                                uint32_t flags) override;
