@@ -6,11 +6,14 @@
 #define TAVO_OSAL_H
 
 #include "tavo_osal/init.h"
+#include "tavo_osal/ipc_semaphore.h"
 #include "tavo_osal/list.h"
 #include "tavo_osal/log.h"
 #include "tavo_osal/memory.h"
 #include "tavo_osal/msg_queue.h"
+#include "tavo_osal/msg_queue_key.h"
 #include "tavo_osal/network.h"
+#include "tavo_osal/shared_memory.h"
 #include "tavo_osal/socket.h"
 #include "tavo_osal/dl.h"
 #include "tavo_osal/file.h"
