@@ -3,17 +3,33 @@
 #include <binder/IServiceManager.h>
 #include <unistd.h>
 
+#include <new>
+
 #include "ipc/service_location.h"
 #include "log/module_log.h"
+
+using android::ITavoBinder;
+using android::sp;
 
 namespace {
 
 constexpr char kTag[] = "MSGQUEUE_BINDER";
 constexpr char kSignature[] = "android::sp<android::ITavoBinder> tavo_osal_get_service(TAVO_CHAR*)";
 
+// Waits as long as the platform does. No memory for a proxy is no service.
+sp<ITavoBinder> ask_service_manager() {
+    try {
+        const sp<android::IServiceManager> manager = android::defaultServiceManager();
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, " got defaultservice %s\n", tavo::kServiceName);
+        return ITavoBinder::asInterface(manager->getService(android::String16(tavo::kServiceName)));
+    } catch (const std::bad_alloc&) {
+        return nullptr;
+    }
+}
+
 }  // namespace
 
-android::sp<android::ITavoBinder> tavo_osal_get_service(TAVO_CHAR*) {
+sp<ITavoBinder> tavo_osal_get_service(TAVO_CHAR*) {
     // The progress lines are at the highest level, and users' log filters rely on seeing them.
     TAVO_LOG(kTag, TAVO_LOG_INFO, "++Entered\n");
     const tavo::MarkerPath marker;
@@ -25,10 +41,7 @@ android::sp<android::ITavoBinder> tavo_osal_get_service(TAVO_CHAR*) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "Service is not available\n");
         return nullptr;
     }
-    const android::sp<android::IServiceManager> manager = android::defaultServiceManager();
-    TAVO_LOG(kTag, TAVO_LOG_ERROR, " got defaultservice %s\n", tavo::kServiceName);
-    const android::sp<android::IBinder> binder = manager->getService(android::String16(tavo::kServiceName));
-    const android::sp<android::ITavoBinder> service = android::ITavoBinder::asInterface(binder);
+    const sp<ITavoBinder> service = ask_service_manager();
     if (service == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, " %s () Failed to get service (%s) \n", kSignature, tavo::kServiceName);
         return nullptr;
