@@ -3,19 +3,35 @@
 #include <binder/IServiceManager.h>
 #include <unistd.h>
 
+#include <new>
+
 #include "ipc/service_location.h"
 #include "log/module_log.h"
+
+using android::ITavoBinder;
+using android::sp;
 
 namespace {
 
 // Named in the message whichever family looks the service up.
 constexpr char kSignature[] = "android::sp<android::ITavoBinder> tavo_osal_get_service(TAVO_CHAR*)";
 
+// Waits as long as the platform does. No memory for a proxy is no service.
+sp<ITavoBinder> ask_service_manager(const tavo::LookupLog& log) {
+    try {
+        const sp<android::IServiceManager> manager = android::defaultServiceManager();
+        if (log.tells_progress) TAVO_LOG(log.tag, TAVO_LOG_ERROR, " got defaultservice %s\n", tavo::kServiceName);
+        return ITavoBinder::asInterface(manager->getService(android::String16(tavo::kServiceName)));
+    } catch (const std::bad_alloc&) {
+        return nullptr;
+    }
+}
+
 }  // namespace
 
 namespace tavo {
 
-android::sp<android::ITavoBinder> find_service(const LookupLog& log) {
+sp<ITavoBinder> find_service(const LookupLog& log) {
     TAVO_LOG(log.tag, log.trace_level, "++Entered\n");
     const MarkerPath marker;
     // The progress lines are at the highest level, and users' log filters rely on seeing them.
@@ -29,10 +45,7 @@ android::sp<android::ITavoBinder> find_service(const LookupLog& log) {
         TAVO_LOG(log.tag, TAVO_LOG_ERROR, "Service is not available\n");
         return nullptr;
     }
-    const android::sp<android::IServiceManager> manager = android::defaultServiceManager();
-    if (log.tells_progress) TAVO_LOG(log.tag, TAVO_LOG_ERROR, " got defaultservice %s\n", kServiceName);
-    const android::sp<android::IBinder> binder = manager->getService(android::String16(kServiceName));
-    const android::sp<android::ITavoBinder> service = android::ITavoBinder::asInterface(binder);
+    const sp<ITavoBinder> service = ask_service_manager(log);
     if (service == nullptr) {
         TAVO_LOG(log.tag, TAVO_LOG_ERROR, " %s () Failed to get service (%s) \n", kSignature, kServiceName);
         return nullptr;
@@ -43,4 +56,4 @@ android::sp<android::ITavoBinder> find_service(const LookupLog& log) {
 
 }  // namespace tavo
 
-android::sp<android::ITavoBinder> tavo_osal_get_service(TAVO_CHAR*) { return tavo::find_service(tavo::kQueueLookup); }
+sp<ITavoBinder> tavo_osal_get_service(TAVO_CHAR*) { return tavo::find_service(tavo::kQueueLookup); }
