@@ -5,9 +5,11 @@
 #ifndef TAVO_OSAL_H
 #define TAVO_OSAL_H
 
+#include "tavo_osal/condition.h"
 #include "tavo_osal/list.h"
 #include "tavo_osal/log.h"
 #include "tavo_osal/memory.h"
+#include "tavo_osal/mutex.h"
 #include "tavo_osal/status.h"
 
 #endif
