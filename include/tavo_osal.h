@@ -10,6 +10,7 @@
 #include "tavo_osal/log.h"
 #include "tavo_osal/memory.h"
 #include "tavo_osal/mutex.h"
+#include "tavo_osal/semaphore.h"
 #include "tavo_osal/status.h"
 
 #endif

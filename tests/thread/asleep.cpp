@@ -47,4 +47,14 @@ void Bedside::wait_until_asleep() {
     tavo::test::wait_until_asleep(thread_);
 }
 
+void Bedside::wait_until_gone() {
+    // Also used for a thread whose sleep was waited for already.
+    while (sem_trywait(&arrived_) != 0 && thread_ == 0) usleep(1000);
+    for (int i = 0; i < 20000; ++i) {
+        if (state_of(thread_) == '?') return;
+        usleep(1000);
+    }
+    FAIL() << "the thread does not end";
+}
+
 }  // namespace tavo::test

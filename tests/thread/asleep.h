@@ -5,6 +5,8 @@
 #include <semaphore.h>
 #include <sys/types.h>
 
+#include <atomic>
+
 namespace tavo::test {
 
 pid_t thread_id();
@@ -24,10 +26,12 @@ public:
     void going_to_sleep();
     // In the test. May be used again for the thread's next wait.
     void wait_until_asleep();
+    // In the test: until the thread has ended.
+    void wait_until_gone();
 
 private:
     sem_t arrived_;
-    pid_t thread_ = 0;
+    std::atomic<pid_t> thread_ = 0;
 };
 
 // Whether this is a build for ThreadSanitizer.
