@@ -6,6 +6,7 @@
 #define TAVO_OSAL_H
 
 #include "tavo_osal/condition.h"
+#include "tavo_osal/event.h"
 #include "tavo_osal/list.h"
 #include "tavo_osal/log.h"
 #include "tavo_osal/memory.h"
