@@ -13,5 +13,6 @@
 #include "tavo_osal/mutex.h"
 #include "tavo_osal/semaphore.h"
 #include "tavo_osal/status.h"
+#include "tavo_osal/thread.h"
 
 #endif

@@ -7,6 +7,8 @@
 #include <pthread.h>
 #include <signal.h>
 
+#include <cstdio>
+
 #include "log/cancel_shield.h"
 #include "log/module_log.h"
 #include "thread/platform_threads.h"
@@ -59,11 +61,13 @@ void clean_up(void* opaque) {
 
 }  // namespace
 
-int install_cancel_handler() {
+void install_cancel_handler() {
     struct sigaction action = {};
     action.sa_handler = on_cancel_signal;
     sigemptyset(&action.sa_mask);
-    return sigaction(kCancelSignal, &action, nullptr);
+    if (sigaction(kCancelSignal, &action, nullptr) == 0) return;
+    perror(" sigaction \n");
+    printf("Rigistered signal handler failed");
 }
 
 int wait_cancellably(int (*wait)(void*), void (*release)(void*), void* context) {

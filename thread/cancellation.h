@@ -5,8 +5,8 @@
 
 namespace tavo {
 
-// Installs the handler that ends the thread it runs on. 0, or -1 with errno set.
-int install_cancel_handler();
+// Installs the handler that ends the thread it runs on. A failure is printed on standard output and standard error.
+void install_cancel_handler();
 
 // Calls wait(context), during which a cancellation ends the thread at once although the thread holds a shield. A
 // cancelled thread calls release(context) once, with the wait's mutex held where the platform takes it again, and
