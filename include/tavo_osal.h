@@ -23,5 +23,14 @@
 #include "tavo_osal/process.h"
 #include "tavo_osal/status.h"
 #include "tavo_osal/string.h"
+#include "tavo_osal/condition.h"
+#include "tavo_osal/event.h"
+#include "tavo_osal/list.h"
+#include "tavo_osal/log.h"
+#include "tavo_osal/memory.h"
+#include "tavo_osal/mutex.h"
+#include "tavo_osal/semaphore.h"
+#include "tavo_osal/status.h"
+#include "tavo_osal/thread.h"
 
 #endif
