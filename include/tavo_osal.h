@@ -5,6 +5,7 @@
 #ifndef TAVO_OSAL_H
 #define TAVO_OSAL_H
 
+#include "tavo_osal/clock.h"
 #include "tavo_osal/condition.h"
 #include "tavo_osal/event.h"
 #include "tavo_osal/list.h"
