@@ -15,5 +15,6 @@
 #include "tavo_osal/semaphore.h"
 #include "tavo_osal/status.h"
 #include "tavo_osal/thread.h"
+#include "tavo_osal/timer.h"
 
 #endif
