@@ -5,6 +5,7 @@
 #ifndef TAVO_OSAL_H
 #define TAVO_OSAL_H
 
+#include "tavo_osal/clock.h"
 #include "tavo_osal/condition.h"
 #include "tavo_osal/dl.h"
 #include "tavo_osal/event.h"
@@ -25,5 +26,6 @@
 #include "tavo_osal/status.h"
 #include "tavo_osal/string.h"
 #include "tavo_osal/thread.h"
+#include "tavo_osal/timer.h"
 
 #endif
