@@ -210,7 +210,7 @@ int32_t TAVO_MessageQueue::tavo_android_msg_queue_wait_for_msg(TAVO_MessageQueue
     const int result = poll(slots, count, iTimeout);
     if (result < 0) TAVO_LOG(kTag, TAVO_LOG_INFO, "Message queue returned error %d\n", result);
     for (int i = 0; i < 3 && result > 0; ++i) {
-        if ((slots[i].revents & POLLIN) != 0) queues[i]->bMsg = 1;
+        if (queues[i] != nullptr && (slots[i].revents & POLLIN) != 0) queues[i]->bMsg = 1;
     }
     return result;
 }

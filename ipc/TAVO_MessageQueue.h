@@ -128,7 +128,7 @@ public:
     int32_t iReadFd;         ///< read end of the pipe
     int32_t iWriteFd;        ///< write end of the pipe
     uint8_t bMsg;            ///< 1 when the last look saw something pending, else 0
-    uint8_t uiRoomFor;       ///< put's own: the pipe has room for frames of up to 2 to this power; 0 when not known
+    uint8_t uiRoomFor;       ///< put's own: room was made for frames of up to 2 to this power; 0 for none
     uint32_t uiId;           ///< the owner's number for the queue; only stored
     char acServiceName[64];  ///< the queue's name, for messages; zeroed at first
     /** @} */
