@@ -139,7 +139,7 @@ TAVO_Status tavo_msg_queue_sender_init(TAVO_CHAR* pcServiceName, TAVO_INT64* piM
     *piMqId = handle_of(queue.get());
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Message queue object returned: addr %p  :  service %s\n",
              static_cast<void*>(queue.get()), pcServiceName);
-    queue.release();
+    static_cast<void>(queue.release());  // the handle's now
     use.keep();
     return TAVO_SUCCESS;
 }

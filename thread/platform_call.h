@@ -3,14 +3,14 @@
 
 #include <cerrno>
 
-#include "tavo_osal/log.h"
+#include "log/module_log.h"
 #include "tavo_osal/status.h"
 
 namespace tavo {
 
 // Logs one line at the error level under the caller's source line. The format may leave out the error number.
 [[gnu::cold, gnu::noinline]] inline void log_failure(const char* tag, const char* format, int error, int line) {
-    tavo_print_log(TAVO_LOG_ERROR, 0, line, tag, format, error);
+    TAVO_LOG_AT(line, tag, TAVO_LOG_ERROR, format, error);
 }
 
 // For a platform call that answers with an error number.
@@ -30,7 +30,7 @@ inline TAVO_Status checked_errno(const char* tag, int result, const char* format
 // For arguments that are not passed on.
 [[gnu::cold, gnu::noinline]] inline TAVO_Status refused(const char* tag, const char* message,
                                                         int line = __builtin_LINE()) {
-    tavo_print_log(TAVO_LOG_ERROR, 0, line, tag, "%s", message);
+    TAVO_LOG_AT(line, tag, TAVO_LOG_ERROR, "%s", message);
     return TAVO_INVALID_PARAM;
 }
 

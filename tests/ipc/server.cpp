@@ -1,10 +1,13 @@
 #include "ipc/server.h"
 
+#include <fcntl.h>
 #include <malloc.h>
 #include <signal.h>
+#include <sys/resource.h>
+#include <unistd.h>
 
-#include <cstdlib>
 #include <iostream>
+#include <vector>
 
 #include "tavo_osal/init.h"
 
@@ -19,6 +22,24 @@ constexpr char kAnswer[] = "answer ";
 // Setting the log preference writes to standard output, so answers are lines of a kind.
 void answer(size_t value) { std::cout << "\n" << kAnswer << value << std::endl; }
 
+std::vector<int> g_taken;
+
+size_t take_descriptors() {
+    constexpr rlim_t kLimit = 100;
+    rlimit limit = {};
+    getrlimit(RLIMIT_NOFILE, &limit);
+    limit.rlim_cur = kLimit;
+    setrlimit(RLIMIT_NOFILE, &limit);
+    for (int taken = 0; (taken = fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, 0)) >= 0;) g_taken.push_back(taken);
+    return g_taken.size();
+}
+
+size_t give_descriptors() {
+    for (const int taken : g_taken) close(taken);
+    g_taken.clear();
+    return 0;
+}
+
 }  // namespace
 
 TEST_ROLE(osal_server) {
@@ -27,6 +48,8 @@ TEST_ROLE(osal_server) {
     for (std::string question; std::getline(std::cin, question);) {
         if (question == "exit") break;
         if (question == "allocated") answer(allocated_bytes());
+        if (question == "take") answer(take_descriptors());
+        if (question == "give") answer(give_descriptors());
     }
     return 0;
 }

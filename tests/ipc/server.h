@@ -19,6 +19,9 @@ public:
     // What tavo_osal_init() answered.
     int status() const { return status_; }
     size_t allocated_bytes();
+    // Leaves the server without a free descriptor, or gives it back what it had.
+    void take_descriptors() { ask("take"); }
+    void give_descriptors() { ask("give"); }
     // Has it exit by itself, so that a sanitizer looks at what it leaves behind; its exit status.
     int exit();
     void kill();

@@ -36,8 +36,9 @@ bool may_end_interrupted_wait() {
     // glibc makes a thread's cancellation asynchronous for as long as it sleeps in the kernel, and only then.
     if (type == PTHREAD_CANCEL_ASYNCHRONOUS) return true;
 #endif
-    // The signal came just before the sleep or after it, or the C library marks its sleeps in another way (glibc
-    // from 2.41), or the sanitizer keeps an account of its own that a handler must not jump out of.
+    // The signal came before the sleep or after it, or the C library marks its sleeps in another way (glibc from
+    // 2.41), or the sanitizer keeps an account of its own that a handler must not jump out of. In the latter two cases
+    // a signal between the wait's last look and its sleep is noticed at the next wake-up only.
     pthread_setcancelstate(PTHREAD_CANCEL_ENABLE, &state);
     pthread_cancel(pthread_self());
     return false;
