@@ -37,8 +37,9 @@ status_t BBinder::onTransact(uint32_t code, const Parcel& data, Parcel* reply, u
             const int fd = data.readFileDescriptor();
             if (fd < 0) return BAD_TYPE;
             Vector<String16> args;
-            for (int32_t count = data.readInt32(); count > 0 && data.dataAvail() > 0; --count) {
-                args.add(data.readString16());
+            String16 arg;
+            for (int32_t count = data.readInt32(); count > 0 && data.readString16(&arg) == NO_ERROR; --count) {
+                args.add(arg);
             }
             return dump(fd, args);
         }

@@ -17,7 +17,7 @@ BpBinder::BpBinder(int32_t handle) : mHandle(handle), mAttached(std::make_unique
 
 BpBinder::~BpBinder() {
     // Before the handle is given back: its number may then come to mean another object.
-    ProcessState::self()->expungeHandle(mHandle, this);
+    ProcessState::instance()->expungeHandle(mHandle, this);
     if (Driver* driver = ProcessState::driver()) driver->release(mHandle);
 }
 

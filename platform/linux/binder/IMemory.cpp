@@ -32,7 +32,7 @@ status_t BnMemoryHeap::onTransact(uint32_t code, const Parcel& data, Parcel* rep
     if (code != HEAP_ID) return BBinder::onTransact(code, data, reply, flags);
     CHECK_INTERFACE(IMemoryHeap, data, reply);
     const size_t size = getSize();
-    if (size > UINT32_MAX) return BAD_VALUE;
+    if (uint64_t{size} > UINT32_MAX) return BAD_VALUE;
     reply->writeFileDescriptor(getHeapID());
     reply->writeUint32(static_cast<uint32_t>(size));
     reply->writeUint32(getFlags());

@@ -64,8 +64,12 @@ public:
             Parcel data, reply;
             data.writeInterfaceToken(descriptor);
             data.writeInt32(index);
-            if (remote()->transact(LIST_SERVICES_TRANSACTION, data, &reply) != NO_ERROR) return names;
-            names.add(reply.readString16());
+            String16 name;
+            if (remote()->transact(LIST_SERVICES_TRANSACTION, data, &reply) != NO_ERROR ||
+                reply.readString16(&name) != NO_ERROR) {
+                return names;
+            }
+            names.add(name);
         }
     }
 

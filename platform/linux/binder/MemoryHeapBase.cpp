@@ -15,7 +15,9 @@ constexpr char kTag[] = "MemoryHeapBase";
 // What memfd_create leaves of a file name's 255 bytes behind its own prefix.
 constexpr size_t kMaxNameLength = 249;
 
-void logFailure(const char* call) { __android_log_print(ANDROID_LOG_ERROR, kTag, "%s failed: %m", call); }
+void logFailure(const char* call) {
+    __android_log_print(ANDROID_LOG_ERROR, kTag, "%s failed: %s", call, strerror(errno));
+}
 
 size_t wholePages(size_t size) {
     const auto page = static_cast<size_t>(sysconf(_SC_PAGESIZE));

@@ -64,8 +64,13 @@ status_t Parcel::writeObject(const flat_binder_object& object) {
     uint8_t* bytes = place(sizeof object);
     if (bytes == nullptr) return mError;
     memcpy(bytes, &object, sizeof object);
-    if (!isNullBinder(object)) mOffsets.push_back(offset);
+    if (!isNullBinder(object)) listObject(offset);
     return NO_ERROR;
+}
+
+// The list ascends, also when objects are written out of order: drivers refuse any other.
+void Parcel::listObject(size_t offset) {
+    mOffsets.insert(std::upper_bound(mOffsets.begin(), mOffsets.end(), offset), offset);
 }
 
 status_t Parcel::writeStrongBinder(const sp<IBinder>& val) {
@@ -105,8 +110,11 @@ status_t Parcel::writeDupFileDescriptor(int fd) {
 // Takes over the objects that lie wholly in a part of another parcel, whose bytes were copied here.
 status_t Parcel::adoptObjects(const Parcel& from, size_t start, size_t len, size_t to) {
     const binder_size_t* offsets = from.objects();
+    size_t free = start;
     for (size_t i = 0; i < from.objectsCount(); ++i) {
-        if (!fits(offsets[i], start, start + len)) continue;
+        // No object may reach into the one before it: putting a new descriptor in the one would change the other.
+        if (!fits(offsets[i], free, start + len)) continue;
+        free = static_cast<size_t>(offsets[i]) + sizeof(flat_binder_object);
         const size_t offset = static_cast<size_t>(offsets[i]) - start + to;
         flat_binder_object object = objectAt(offset);
         if (object.hdr.type == BINDER_TYPE_FD) {
@@ -119,7 +127,7 @@ status_t Parcel::adoptObjects(const Parcel& from, size_t start, size_t len, size
         } else {
             mHeld.push_back(binderOf(object));
         }
-        mOffsets.push_back(offset);
+        listObject(offset);
     }
     return NO_ERROR;
 }

@@ -135,14 +135,15 @@ status_t Parcel::writeInt32Array(size_t len, const int32_t* val) { return writeA
 status_t Parcel::writeByteArray(size_t len, const uint8_t* val) { return writeArray(len, val, sizeof *val); }
 
 status_t Parcel::read(void* outData, size_t len) const {
+    if (len == 0) return NO_ERROR;
     const void* bytes = readInplace(len);
     if (bytes == nullptr) return NOT_ENOUGH_DATA;
-    if (len != 0) memcpy(outData, bytes, len);
+    memcpy(outData, bytes, len);
     return NO_ERROR;
 }
 
 const void* Parcel::readInplace(size_t len) const {
-    if (len > kMaxSize || padded(len) > dataAvail()) return nullptr;
+    if (mDataPos > mDataSize || len > kMaxSize || padded(len) > dataAvail()) return nullptr;
     const void* bytes = mData + mDataPos;
     mDataPos += padded(len);
     return bytes;
@@ -224,6 +225,14 @@ String16 Parcel::readString16() const {
     size_t length = 0;
     const char16_t* text = readString16Inplace(&length);
     return text != nullptr ? String16(text, length) : String16();
+}
+
+status_t Parcel::readString16(String16* pArg) const {
+    const size_t position = mDataPos;
+    size_t length = 0;
+    const char16_t* text = readString16Inplace(&length);
+    if (text != nullptr) return pArg->setTo(text, length);
+    return mDataPos != position ? UNEXPECTED_NULL : NOT_ENOUGH_DATA;
 }
 
 const char16_t* Parcel::readString16Inplace(size_t* outLen) const {

@@ -125,6 +125,8 @@ public:
     // Empty on failure.
     String8 readString8() const;
     String16 readString16() const;
+    // UNEXPECTED_NULL for a null string.
+    status_t readString16(String16* pArg) const;
     // Terminated; null for a null string and on failure.
     const char16_t* readString16Inplace(size_t* outLen) const;
     // Null on failure.
@@ -173,6 +175,7 @@ private:
 
     // ParcelObjects.cpp
     status_t writeObject(const flat_binder_object& object);
+    void listObject(size_t offset);
     status_t adoptObjects(const Parcel& from, size_t start, size_t len, size_t to);
     bool readObject(flat_binder_object* object) const;
     bool isListed(size_t offset) const;
