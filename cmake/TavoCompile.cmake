@@ -1,6 +1,8 @@
 # The compile settings every target of this project shares, as one interface target.
 add_library(tavo_compile INTERFACE)
 target_compile_features(tavo_compile INTERFACE cxx_std_17 c_std_11)
+# POSIX and the GNU additions, in C as well: C++ compilers say so by themselves.
+target_compile_definitions(tavo_compile INTERFACE $<$<COMPILE_LANGUAGE:C>:_GNU_SOURCE>)
 target_compile_options(tavo_compile INTERFACE
     -Wall -Wextra -Wconversion -Wshadow -Wformat=2 -Wno-format-nonliteral -Werror
     -fvisibility=hidden

@@ -5,9 +5,20 @@
 #ifndef TAVO_OSAL_H
 #define TAVO_OSAL_H
 
+#include "tavo_osal/init.h"
 #include "tavo_osal/list.h"
 #include "tavo_osal/log.h"
 #include "tavo_osal/memory.h"
+#include "tavo_osal/msg_queue.h"
+#include "tavo_osal/network.h"
+#include "tavo_osal/socket.h"
+#include "tavo_osal/dl.h"
+#include "tavo_osal/file.h"
+#include "tavo_osal/list.h"
+#include "tavo_osal/log.h"
+#include "tavo_osal/memory.h"
+#include "tavo_osal/process.h"
 #include "tavo_osal/status.h"
+#include "tavo_osal/string.h"
 
 #endif

@@ -64,19 +64,17 @@ bool passes(uint32_t level, uint32_t module) {
     return passed && (level != TAVO_LOG_PERFORMANCE || load(g_uiPerformance) != 0);
 }
 
-// The decimal number that text begins with; false when text is not wholly a number.
-bool parse_number(const char* text, long& number) {
+// The decimal number that text is; 0, and a logged error, when it is none.
+long parse_number(const char* text) {
     char* end = nullptr;
-    number = strtol(text, &end, 10);
-    if (*end == '\0') return true;
+    const long number = strtol(text, &end, 10);
+    if (*end == '\0') return number;
     TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid string is passed. string = %s.\n", text);
-    number = 0;
-    return false;
+    return 0;
 }
 
 void apply_level(const char* text) {
-    long level = 0;
-    parse_number(text, level);
+    const long level = parse_number(text);
     if (level >= 0 && level <= static_cast<long>(kHighestLevel)) {
         store(g_uiMxEnabledLogLevel, static_cast<uint32_t>(level));
     }
@@ -91,8 +89,8 @@ bool apply_modules(const char* list, bool& cleared) {
     }
     char* rest = nullptr;
     for (char* item = strtok_r(copy, ",", &rest); item != nullptr; item = strtok_r(nullptr, ",", &rest)) {
-        long module = 0;
-        if (!parse_number(item, module) || module < 1 || module > static_cast<long>(kModuleCount)) continue;
+        const long module = parse_number(item);
+        if (module < 1 || module > static_cast<long>(kModuleCount)) continue;
         if (!cleared) store(g_uiEnabledModuleMask, 0U);
         cleared = true;
         __atomic_fetch_or(&g_uiEnabledModuleMask, 1U << (module - 1), __ATOMIC_SEQ_CST);
@@ -102,9 +100,13 @@ bool apply_modules(const char* list, bool& cleared) {
 }
 
 void apply_file_name(const char* name) {
-    if (snprintf(g_acFilePath, sizeof g_acFilePath, "%s%s%s", "/tmp/", name, ".txt") < 0) {
+    TAVO_CHAR path[sizeof g_acFilePath] = {};
+    if (snprintf(path, sizeof path, "%s%s%s", "/tmp/", name, ".txt") < 0) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "snprintf failed.\n");
+        return;
     }
+    // The whole path has no single exchange; byte by byte, two setters at once mix names but never race.
+    for (size_t i = 0; i < sizeof path; ++i) store(g_acFilePath[i], path[i]);
 }
 
 // Splits the preference in place and applies it from left to right.
@@ -165,16 +167,22 @@ void tavo_print_log(uint32_t uiLevel, uint32_t uiModule, int iLine, const TAVO_C
 }
 
 void tavo_set_log_preference(const TAVO_CHAR* pcLogPreference, TAVO_LogCallback fpCallback, void* pvParam) {
-    if (__atomic_load_n(&g_uiEnvValueRead, __ATOMIC_SEQ_CST) == 1) {
+    // Of several threads that find LOG_PREF at once, the one that sets the latch takes its value: it is split in
+    // place, which two threads must not do to one string.
+    char* preference = nullptr;
+    bool consumed = __atomic_load_n(&g_uiEnvValueRead, __ATOMIC_SEQ_CST) == 1;
+    if (!consumed) {
+        preference = getenv("LOG_PREF");
+        if (preference != nullptr) consumed = __atomic_exchange_n(&g_uiEnvValueRead, 1U, __ATOMIC_SEQ_CST) == 1;
+    }
+    if (consumed) {
         printf("g_uiEnvValueRead var read and use already set pref");
         return;
     }
 
     char* copy = nullptr;
-    char* preference = getenv("LOG_PREF");
     if (preference != nullptr) {
         printf("Environment variable LOG_PREF is %s\n", preference);
-        store(g_uiEnvValueRead, 1U);
     } else {
         printf("No preferences received from env LOG_PREF ");
         if (pcLogPreference == nullptr) {

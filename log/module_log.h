@@ -12,35 +12,43 @@ namespace tavo {
 // relaxed atomic loads (plain loads in machine code), since a preference may be set at any time.
 inline bool log_enabled(uint32_t level) {
     if (level > __atomic_load_n(&g_uiMxEnabledLogLevel, __ATOMIC_RELAXED)) return false;
+    if (level == TAVO_LOG_PERFORMANCE && __atomic_load_n(&g_uiPerformance, __ATOMIC_RELAXED) == 0) return false;
     return level <= TAVO_LOG_WARNING || __atomic_load_n(&g_uiEnabledModuleMask, __ATOMIC_RELAXED) == UINT32_MAX;
 }
+
+}  // namespace tavo
+
+// A macro, because only a macro can take the caller's source line.
+#define TAVO_LOG(tag, level, ...) TAVO_LOG_AT(__LINE__, tag, level, __VA_ARGS__)
+
+// For helpers that log on behalf of their callers, who hand in their line as a defaulted __builtin_LINE().
+#define TAVO_LOG_AT(line, tag, level, ...)                                           \
+    do {                                                                             \
+        if (__builtin_expect(tavo::log_enabled(level), (level) <= TAVO_LOG_WARNING)) \
+            tavo_print_log((level), 0, (line), (tag), __VA_ARGS__);                  \
+    } while (false)
+
+namespace tavo {
 
 // A function's entry and exit in the trace.
 class ScopeTrace {
 public:
-    ScopeTrace(const char* tag, int line, uint32_t level) : tag_(tag), line_(line), level_(level) {
-        if (__builtin_expect(log_enabled(level_), false)) tavo_print_log(level_, 0, line_, tag_, "++Entered\n");
+    ScopeTrace(const char* tag, int line, const char* entered) : tag_(tag), line_(line) {
+        TAVO_LOG_AT(line_, tag_, TAVO_LOG_TRACE, "%s", entered);
     }
-    ~ScopeTrace() {
-        if (__builtin_expect(log_enabled(level_), false)) tavo_print_log(level_, 0, line_, tag_, "--Exiting\n");
-    }
+    // A thread may be cancelled, which unwinds its stack, while it writes the log.
+    ~ScopeTrace() noexcept(false) { TAVO_LOG_AT(line_, tag_, TAVO_LOG_TRACE, "--Exiting\n"); }
     ScopeTrace(const ScopeTrace&) = delete;
     ScopeTrace& operator=(const ScopeTrace&) = delete;
 
 private:
     const char* const tag_;
     const int line_;
-    const uint32_t level_;
 };
 
 }  // namespace tavo
 
 // "++Entered" here and "--Exiting" wherever the function is left.
-#define TAVO_TRACE_SCOPE(tag) const tavo::ScopeTrace scope_trace((tag), __LINE__, TAVO_LOG_TRACE)
-
-// A macro, because only a macro can take the caller's source line.
-#define TAVO_LOG(tag, level, ...)                                                     \
-    do {                                                                              \
-        if (__builtin_expect(tavo::log_enabled(level), (level) <= TAVO_LOG_WARNING))  \
-            tavo_print_log((level), 0, __LINE__, (tag), __VA_ARGS__);                 \
-    } while (false)
+#define TAVO_TRACE_SCOPE(tag) TAVO_TRACE_SCOPE_AS(tag, "++Entered\n")
+// For a function that says it entered in words of its own.
+#define TAVO_TRACE_SCOPE_AS(tag, entered) const tavo::ScopeTrace scope_trace((tag), __LINE__, (entered))

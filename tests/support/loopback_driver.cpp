@@ -52,11 +52,12 @@ struct LoopbackDriver::Buffer {
 };
 
 LoopbackDriver& LoopbackDriver::open() {
-    if (g_driver == nullptr) {
+    static std::once_flag once;
+    std::call_once(once, [] {
         android::registerDriver("loopback", make_driver);
         setenv("BINDER_DRIVER", "loopback", 1);
         android::ProcessState::self();
-    }
+    });
     return *g_driver;
 }
 

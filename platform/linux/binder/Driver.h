@@ -29,7 +29,7 @@ class Parcel;
 class LIBBINDER_EXPORT Driver {
 public:
     // The most bytes of data, and the most bytes of anything else, that one parcel may hold.
-    static constexpr size_t kParcelLimit = 1024 * 1024;
+    static constexpr size_t kParcelLimit = size_t{1024} * 1024;
 
     // Who called, as the kernel says, not as the caller says.
     struct Caller {

@@ -44,7 +44,7 @@ bool Link::readMessage(bool& again) {
         return true;
     }
     // Only a link that was made for somebody else's use learns here who uses it.
-    if (size > 0 && sender.pid != 0) peer_ = Driver::Caller{sender.pid, sender.uid};
+    if (size > 0 && sender.pid != 0) peer_ = packed({sender.pid, sender.uid});
     return size > 0 && static_cast<size_t>(size) <= sizeof packet &&
            handleMessage(packet, static_cast<size_t>(size), descriptors);
 }

@@ -38,13 +38,16 @@ public:
     static constexpr size_t kMaxServedChannels = 1024;
 
     Link(LinkEvents& events, UniqueFd control, Driver::Caller peer, uint64_t peerInstance = 0)
-        : events_(events), control_(std::move(control)), peer_(peer), peerInstance_(peerInstance) {}
+        : events_(events), control_(std::move(control)), peer_(packed(peer)), peerInstance_(peerInstance) {}
 
     int fd() const override { return control_.get(); }
     void onReady() override;
 
     // Who is at the other end, for transactions that come back along a channel of this process.
-    Driver::Caller peer() const { return peer_; }
+    Driver::Caller peer() const {
+        const uint64_t both = peer_;
+        return {static_cast<pid_t>(both >> 32), static_cast<uid_t>(both)};
+    }
     // The peer's own number, 0 where this process was not the one to connect.
     uint64_t peerInstance() const { return peerInstance_; }
 
@@ -70,12 +73,16 @@ public:
 private:
     static constexpr size_t kMaxIdleChannels = 16;
 
+    static uint64_t packed(const Driver::Caller& peer) {
+        return static_cast<uint64_t>(static_cast<uint32_t>(peer.pid)) << 32 | peer.uid;
+    }
+
     bool readMessage(bool& again);
     bool handleMessage(const uint8_t* packet, size_t size, std::vector<UniqueFd>& descriptors);
 
     LinkEvents& events_;
     const UniqueFd control_;
-    std::atomic<Driver::Caller> peer_;
+    std::atomic<uint64_t> peer_;  // pid and uid, changed as one
     const uint64_t peerInstance_;
     std::atomic<bool> dead_{false};
     Baton baton_;

@@ -127,7 +127,7 @@ TEST(Object, OfThisProcessCannotOutliveItSoNobodyIsTold) {
 
 TEST(Object, AnswersAPing) {
     Parcel data, reply;
-    EXPECT_EQ((new BBinder)->transact(IBinder::PING_TRANSACTION, data, &reply), NO_ERROR);
+    EXPECT_EQ(sp<BBinder>(new BBinder)->transact(IBinder::PING_TRANSACTION, data, &reply), NO_ERROR);
     EXPECT_EQ(reply.dataSize(), 4U);
     EXPECT_EQ(reply.readInt32(), NO_ERROR);
 }
@@ -205,7 +205,7 @@ TEST(Object, RefusesATokenOfAnotherInterface) {
     const tavo::test::LogCapture log;
     Parcel data, reply;
     data.writeInterfaceToken(String16("other"));
-    EXPECT_EQ((new Greeter)->transact(IBinder::FIRST_CALL_TRANSACTION, data, &reply), PERMISSION_DENIED);
+    EXPECT_EQ(sp<BBinder>(new Greeter)->transact(IBinder::FIRST_CALL_TRANSACTION, data, &reply), PERMISSION_DENIED);
     EXPECT_EQ(reply.dataSize(), 0U);
 }
 

@@ -49,8 +49,8 @@ TEST(MemoryHeap, IsZeroedMemoryOfWholePages) {
     EXPECT_EQ(heap->heapID(), heap->getHeapID());
     EXPECT_EQ(heap->base(), heap->getBase());
     EXPECT_EQ(heap->virtualSize(), heap->getSize());
-    EXPECT_EQ((new MemoryHeapBase(1))->getSize(), kPage);
-    EXPECT_EQ((new MemoryHeapBase(kPage))->getSize(), kPage);
+    EXPECT_EQ(sp<MemoryHeapBase>(new MemoryHeapBase(1))->getSize(), kPage);
+    EXPECT_EQ(sp<MemoryHeapBase>(new MemoryHeapBase(kPage))->getSize(), kPage);
 }
 
 TEST(MemoryHeap, IsSeenThroughItsDescriptor) {
@@ -252,7 +252,7 @@ TEST(MemoryHeapStub, RefusesASizeThatTheReplyCannotHold) {
     };
     Parcel data, reply;
     data.writeInterfaceToken(IMemoryHeap::descriptor);
-    EXPECT_EQ((new Huge)->transact(IMemoryHeap::HEAP_ID, data, &reply), BAD_VALUE);
+    EXPECT_EQ(sp<BBinder>(new Huge)->transact(IMemoryHeap::HEAP_ID, data, &reply), BAD_VALUE);
 }
 
 }  // namespace

@@ -28,34 +28,28 @@ private:
     std::atomic<int>& sum_;
 };
 
+struct Named : public RefBase {
+    explicit Named(const String16& text) : name(text) {}
+    const String16 name;
+};
+
 TEST(ReferenceCount, OrdersUseOnAnyThreadBeforeDestructionOnAnother) {
-    constexpr int kRounds = 500;
+    constexpr int kRounds = 300;
     std::atomic<int> sum{0};
-    std::atomic<int> round{-1};
-    std::atomic<int> done{0};
-    std::vector<sp<Shared>> references(4);
-    std::vector<std::thread> threads;
-    for (size_t i = 0; i < references.size(); ++i) {
-        threads.emplace_back([&, i] {
-            for (int r = 0; r < kRounds; ++r) {
-                while (round.load() < r) std::this_thread::yield();
-                references[i]->values[i] = 1;
-                references[i].clear();
-                // Relaxed, so that nothing but the reference count orders the write above.
-                done.fetch_add(1, std::memory_order_relaxed);
-            }
-        });
-    }
     for (int r = 0; r < kRounds; ++r) {
-        const sp<Shared> object = new Shared(sum);
-        for (sp<Shared>& reference : references) reference = object;
-        round.store(r);
-        // This thread's own reference goes at any time, so the destructor runs on any of five threads.
-        if (r % 2 != 0) std::this_thread::yield();
-        const_cast<sp<Shared>&>(object).clear();
-        while (done.load(std::memory_order_relaxed) < 4 * (r + 1)) std::this_thread::yield();
+        // Each thread has a reference of its own, so the destructor runs on whichever comes last.
+        sp<Shared> object = new Shared(sum);
+        std::vector<std::thread> threads;
+        for (size_t i = 0; i < 3; ++i) {
+            threads.emplace_back([reference = object, i]() mutable {
+                reference->values[i] = 1;
+                reference.clear();
+            });
+        }
+        object->values[3] = 1;
+        object.clear();
+        for (std::thread& thread : threads) thread.join();
     }
-    for (std::thread& thread : threads) thread.join();
     EXPECT_EQ(sum, 4 * kRounds);
 }
 
@@ -72,6 +66,21 @@ TEST(ReferenceCount, OrdersUseBeforeDestructionWhenAWeakReferenceIsPromoted) {
         user.join();
     }
     EXPECT_LE(sum, 200);
+}
+
+TEST(ReferenceCount, OrdersTheReadersOfACopiedStringBeforeItGoes) {
+    for (int r = 0; r < 200; ++r) {
+        sp<Named> object = new Named(String16("a text of its own"));
+        std::vector<std::thread> threads;
+        for (size_t i = 0; i < 3; ++i) {
+            threads.emplace_back([copy = object->name]() mutable {
+                EXPECT_EQ(copy.string()[2], u't');
+                copy.setTo(String16());
+            });
+        }
+        object.clear();
+        for (std::thread& thread : threads) thread.join();
+    }
 }
 
 TEST(ReferenceCount, OrdersProxiesThatComeAndGo) {

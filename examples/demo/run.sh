@@ -1,0 +1,60 @@
+#!/usr/bin/env bash
+# Plays the demo: a server, a receiver and a sender, three processes that share the queue of key 7.
+#
+#   run.sh DIRECTORY_OF_THE_PROGRAMS DIRECTORY_FOR_OUTPUT
+set -euo pipefail
+
+programs=$1 output=$2
+rm -rf "$output" && mkdir -p "$output"
+pids=()
+trap 'kill "${pids[@]}" 2>/dev/null || true' EXIT
+
+start() { # ROLE: starts it with its output and its log in files of their own
+    "$programs/demo_$1" >"$output/$1.out" 2>"$output/$1.log" &
+    pids+=($!)
+}
+
+wait_for() { # ROLE LINE
+    for _ in $(seq 200); do
+        grep -qx "$2" "$output/$1.out" && return 0
+        sleep 0.05
+    done
+    echo "the $1 did not get as far as '$2'; its log:" >&2
+    cat "$output/$1.log" >&2
+    exit 1
+}
+
+say() { printf '  %-9s %s\n' "$1" "$2"; }
+
+echo "Three processes, one queue:"
+start server
+server=$!
+wait_for server ready
+say server "process $server published the service \"android.tavo.osal\""
+start receiver
+receiver=$!
+wait_for receiver attached
+say receiver "process $receiver attached to key 7"
+start sender
+sender=$!
+wait_for sender attached
+say sender "process $sender attached to key 7"
+
+status=0
+wait "$sender" || status=$?
+wait "$receiver" || status=$?
+say sender "$(grep '^sent' "$output/sender.out" || echo 'did not finish')"
+say receiver "$(grep -E '^(got|message|the sender)' "$output/receiver.out" || echo 'did not finish')"
+say receiver "$(grep 'a second$' "$output/receiver.out" || echo 'has nothing to report')"
+
+for role in server receiver sender; do
+    echo
+    echo "What the $role logged at levels 1 to 3:"
+    sed -n 's/^\(..*\)/  \1/p' "$output/$role.log"
+done
+echo
+if [[ $status -ne 0 ]]; then
+    echo "Messages were lost or damaged: see $output" >&2
+    exit 1
+fi
+echo "All messages arrived intact."

@@ -1,0 +1,180 @@
+// The queues, and the service's life. Its blocks are in TavoOsalServiceBlocks.cpp.
+#include "ipc/TavoOsalService.h"
+
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <memory>
+#include <mutex>
+#include <new>
+
+#include "ipc/TAVO_MessageQueue.h"
+#include "ipc/service_lock.h"
+#include "log/module_log.h"
+#include "tavo_osal/memory.h"
+
+namespace android {
+namespace {
+
+constexpr char kTag[] = "MSGQUEUE_BINDER";
+constexpr char kKeyIndexFile[] = TAVO_STORAGE_ROOT "/shm_key_index_file.txt";
+
+// Sets the file back to one 32-bit 1. False when it could not be opened. itemsLeft is what a read behind that
+// number finds, which is nothing.
+bool resetKeyIndexFile(int& itemsLeft) {
+    FILE* file = fopen(kKeyIndexFile, "w+e");
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "Opening file in write mode, fp = %p.\n", static_cast<void*>(file));
+    if (file == nullptr) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "Opening file in read write mode failed with errno =%d\n", errno);
+        return false;
+    }
+    int32_t index = 0;
+    itemsLeft = static_cast<int>(fread(&index, sizeof index, 1, file));
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "After reading, iRet = %d, index = %d.\n", itemsLeft, index);
+    if (itemsLeft == 0) {
+        index = 1;
+        fseek(file, 0, SEEK_SET);  // between a read and a write, as C wants it
+        fwrite(&index, sizeof index, 1, file);
+    }
+    fseek(file, 0, SEEK_CUR);
+    itemsLeft = static_cast<int>(fread(&index, sizeof index, 1, file));
+    fseek(file, 0, SEEK_SET);
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "After reading, iRet = %d, index = %d.\n", itemsLeft, index);
+    fclose(file);
+    return true;
+}
+
+}  // namespace
+
+TavoOsalService::TavoOsalService() = default;
+TavoOsalService::~TavoOsalService() { TavoOsalServiceDeInit(); }
+
+int TavoOsalService::TavoOsalServiceInit(unsigned int uiMaxNumMsgQueues, unsigned int uiMaxNumSharedMemBlocks) {
+    TAVO_LOG(kTag, TAVO_LOG_TRACE, "++Entered\n");
+    TAVO_LOG(kTag, TAVO_LOG_VERBOSE, "Param1: uiMaxNumMsgQueues = %d\n", static_cast<int>(uiMaxNumMsgQueues));
+    TAVO_LOG(kTag, TAVO_LOG_VERBOSE, "Param2: uiMaxNumSharedMemBlocks = %d\n",
+             static_cast<int>(uiMaxNumSharedMemBlocks));
+    if (uiMaxNumMsgQueues == 0 || uiMaxNumSharedMemBlocks == 0) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid input parameters.\n");
+        TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
+        return TAVO_FAILURE;
+    }
+    if (m_pBlocks != nullptr || m_ppQueues != nullptr) TavoOsalServiceDeInit();
+
+    const std::lock_guard<std::mutex> lock(tavo::service_lock());
+    const int status = initBlockList(uiMaxNumSharedMemBlocks);
+    if (status != TAVO_SUCCESS) {
+        TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
+        return status;
+    }
+    int itemsLeft = 0;
+    if (!resetKeyIndexFile(itemsLeft)) {
+        // Without the file there is no queue table, and the caller is not told. Callers depend on the 0.
+        TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
+        return TAVO_SUCCESS;
+    }
+    // Deliberately as much as whole records would take, although an entry is one pointer.
+    size_t bytes = 0;
+    if (!__builtin_mul_overflow(uiMaxNumMsgQueues, sizeof(KeyRecord), &bytes)) {
+        m_ppQueues = static_cast<KeyRecord**>(malloc(bytes));
+    }
+    if (m_ppQueues == nullptr) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "Memory allocation failed !!!\n");
+        return -1;
+    }
+    m_uiQueueRoom = uiMaxNumMsgQueues;
+    m_uiQueueCount = 0;
+    TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Service class created\n");
+    TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
+    return itemsLeft;
+}
+
+int TavoOsalService::create_message_queue(int key) {
+    if (key == 0) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid key!!\n");
+        return -1;
+    }
+    const std::lock_guard<std::mutex> lock(tavo::service_lock());
+    if (m_ppQueues == nullptr) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "NO LIST\n");
+        return -1;
+    }
+    const int index = findQueue(key);
+    if (index < 0) return addQueue(key);
+    ++m_ppQueues[index]->uiUseCount;
+    return index;
+}
+
+// A queue that cannot be made, for want of descriptors or memory, leaves the table as it was.
+int TavoOsalService::addQueue(int key) {
+    if (m_uiQueueCount == m_uiQueueRoom) {
+        auto** grown = static_cast<KeyRecord**>(realloc(m_ppQueues, m_uiQueueRoom * 2 * sizeof(KeyRecord)));
+        if (grown == nullptr) return -1;
+        m_ppQueues = grown;
+        m_uiQueueRoom *= 2;
+    }
+    auto queue = std::unique_ptr<TAVO_MessageQueue>(new (std::nothrow) TAVO_MessageQueue);
+    if (queue == nullptr) return -1;
+    if (!queue->has_pipe()) {
+        queue->disown_descriptors();
+        return -1;
+    }
+    auto* record = static_cast<KeyRecord*>(calloc(1, sizeof(KeyRecord)));
+    if (record == nullptr) return -1;
+    record->iKey = key;
+    record->uiUseCount = 1;
+    record->pvObject = queue.release();
+    m_ppQueues[m_uiQueueCount] = record;
+    return static_cast<int>(m_uiQueueCount++);
+}
+
+int TavoOsalService::delete_message_queue(int key) {
+    if (key == 0) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid key!!\n");
+        return -1;
+    }
+    std::unique_ptr<TAVO_MessageQueue> deleted;  // declared first: closes its pipe without the lock
+    const std::lock_guard<std::mutex> lock(tavo::service_lock());
+    const int index = findQueue(key);
+    if (index < 0) return -1;
+    KeyRecord* record = m_ppQueues[index];
+    if (--record->uiUseCount > 0) return 0;
+    deleted.reset(static_cast<TAVO_MessageQueue*>(record->pvObject));
+    for (uint32_t i = static_cast<uint32_t>(index); i + 1 < m_uiQueueCount; ++i) m_ppQueues[i] = m_ppQueues[i + 1];
+    m_ppQueues[--m_uiQueueCount] = nullptr;
+    free(record);
+    return 0;
+}
+
+int TavoOsalService::get_fd(int key) {
+    // Unlike get_write_fd, this says nothing of an invalid key. Callers poll with it.
+    if (key == 0) return -1;
+    const std::lock_guard<std::mutex> lock(tavo::service_lock());
+    TAVO_MessageQueue* queue = queueOf(key);
+    return queue != nullptr ? queue->tavo_android_msg_queue_get_fd() : -1;
+}
+
+int TavoOsalService::get_write_fd(int key) {
+    if (key == 0) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid key!!\n");
+        return -1;
+    }
+    const std::lock_guard<std::mutex> lock(tavo::service_lock());
+    TAVO_MessageQueue* queue = queueOf(key);
+    return queue != nullptr ? queue->tavo_android_msg_queue_get_write_fd() : -1;
+}
+
+TAVO_MessageQueue* TavoOsalService::queueOf(int key) const {
+    const int index = findQueue(key);
+    return index >= 0 ? static_cast<TAVO_MessageQueue*>(m_ppQueues[index]->pvObject) : nullptr;
+}
+
+// The key's place in the table, or -1.
+int TavoOsalService::findQueue(int key) const {
+    for (uint32_t i = 0; m_ppQueues != nullptr && i < m_uiQueueCount; ++i) {
+        if (m_ppQueues[i]->iKey == key) return static_cast<int>(i);
+    }
+    return -1;
+}
+
+}  // namespace android

@@ -1,0 +1,245 @@
+// The service's shared-memory blocks.
+#include <binder/MemoryHeapBase.h>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <cstddef>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <mutex>
+#include <new>
+#include <vector>
+
+#include "ipc/TAVO_MessageQueue.h"
+#include "ipc/TavoOsalService.h"
+#include "ipc/service_lock.h"
+#include "log/module_log.h"
+#include "tavo_osal/memory.h"
+
+namespace tavo {
+
+std::mutex& service_lock() {
+    // Never destroyed: the binder threads are still there when static objects go.
+    static std::mutex& lock = *new std::mutex;
+    return lock;
+}
+
+}  // namespace tavo
+
+namespace android {
+namespace {
+
+constexpr char kTag[] = "MSGQUEUE_BINDER";
+constexpr char kCountTag[] = "OSAL_SHM";
+constexpr char kComparing[] = "Comparing input memory index with values available in memory list nodes.\n";
+constexpr size_t kUsualHeaps = 25;
+
+// Every live block of the process, in the order of creation: keeps it whatever becomes of the service object.
+// Released when the process exits.
+class HeapTable {
+public:
+    HeapTable() { heaps_.reserve(kUsualHeaps); }
+
+    void add(const sp<IMemoryHeap>& heap) { heaps_.push_back(heap); }
+    // Hands out the first heap at this address; null when there is none.
+    sp<IMemoryHeap> remove(const void* base) {
+        for (auto heap = heaps_.begin(); heap != heaps_.end(); ++heap) {
+            if ((*heap)->getBase() != base) continue;
+            sp<IMemoryHeap> removed = *heap;
+            heaps_.erase(heap);
+            return removed;
+        }
+        return nullptr;
+    }
+    size_t count() const { return heaps_.size(); }
+
+private:
+    std::vector<sp<IMemoryHeap>> heaps_;
+};
+
+HeapTable g_heaps;
+
+}  // namespace
+
+int TavoOsalService::initBlockList(unsigned int uiMaximum) {
+    auto* blocks = static_cast<BlockList*>(tavo_osal_mem_malloc(sizeof(BlockList)));
+    if (blocks != nullptr) {
+        blocks->uiCount = 0;
+        blocks->uiMaximum = uiMaximum;
+        blocks->pHead = static_cast<TAVO_ListNode*>(tavo_osal_mem_malloc(sizeof(TAVO_ListNode)));
+    }
+    if (blocks == nullptr || blocks->pHead == nullptr) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "ERROR in malloc::\n");
+        tavo_osal_mem_free(blocks);
+        return TAVO_NO_MEMORY;
+    }
+    tavo_osal_init_list_head(blocks->pHead);
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "Shared memory list head node allocation done.\n");
+    m_pBlocks = blocks;
+    return TAVO_SUCCESS;
+}
+
+bool TavoOsalService::hasBlockList() const {
+    if (m_pBlocks != nullptr) return true;
+    TAVO_LOG(kTag, TAVO_LOG_ERROR, "ERROR::Memory list still not initialized. This is fatal.\n");
+    return false;
+}
+
+TavoOsalService::KeyRecord* TavoOsalService::recordOf(TAVO_ListNode* pLink) {
+    return reinterpret_cast<KeyRecord*>(reinterpret_cast<char*>(pLink) - offsetof(KeyRecord, stLink));
+}
+
+sp<IMemoryHeap>* TavoOsalService::holderOf(KeyRecord* pRecord) {
+    return static_cast<sp<IMemoryHeap>*>(pRecord->pvObject);
+}
+
+TavoOsalService::KeyRecord* TavoOsalService::findBlock(int key, uint32_t uiMatchLevel) const {
+    TAVO_LOG(kTag, TAVO_LOG_DEBUG, kComparing);
+    for (TAVO_ListNode* link = m_pBlocks->pHead->next; link != m_pBlocks->pHead; link = link->next) {
+        KeyRecord* record = recordOf(link);
+        TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Trying with node %p.\n", static_cast<void*>(record));
+        if (record->iKey != key) continue;
+        TAVO_LOG(kTag, uiMatchLevel, "Match found at node %p.\n", static_cast<void*>(record));
+        return record;
+    }
+    return nullptr;
+}
+
+sp<IMemoryHeap> TavoOsalService::get_shared_mem(int key, int size) {
+    TAVO_LOG(kTag, TAVO_LOG_VERBOSE, "Param1: iKey = %d\n", key);
+    TAVO_LOG(kTag, TAVO_LOG_VERBOSE, "Param2: iSize = %d\n", size);
+    if (key == 0 || size < 1) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid input parameters\n");
+        return nullptr;
+    }
+    const std::lock_guard<std::mutex> lock(tavo::service_lock());
+    if (!hasBlockList()) return nullptr;
+    if (KeyRecord* record = findBlock(key, TAVO_LOG_DEBUG)) {
+        // The count goes up even when there turns out to be no heap. Callers' deletes rely on it.
+        ++record->uiUseCount;
+        if (record->pvObject != nullptr && *holderOf(record) != nullptr) {
+            TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
+            return *holderOf(record);
+        }
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "Unexpected error!!shared memory allocated is NULL !!\n");
+        return nullptr;
+    }
+    return addBlock(key, size);
+}
+
+sp<IMemoryHeap> TavoOsalService::addBlock(int key, int size) {
+    TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Current num of shared memory blocks = %d\n", static_cast<int>(m_pBlocks->uiCount));
+    TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Max num of shared memory blocks = %d\n", static_cast<int>(m_pBlocks->uiMaximum));
+    if (m_pBlocks->uiCount == m_pBlocks->uiMaximum) {
+        // Advisory: the block is made all the same.
+        TAVO_LOG(kTag, TAVO_LOG_INFO, "Max number of memory blocks allocated already\n");
+    }
+    auto* record = static_cast<KeyRecord*>(calloc(1, sizeof(KeyRecord)));
+    auto* holder = new (std::nothrow) sp<IMemoryHeap>;
+    if (record == nullptr || holder == nullptr) {
+        free(record);
+        delete holder;
+        return nullptr;
+    }
+    tavo_osal_add_to_queue(&record->stLink, m_pBlocks->pHead);
+    TAVO_LOG(kTag, TAVO_LOG_DEBUG, "New node added %p.\n", static_cast<void*>(record));
+
+    char name[64];
+    snprintf(name, sizeof name, "SharedMemory_%d\n", key);  // the newline is part of the name, and kept
+    *holder = new MemoryHeapBase(static_cast<size_t>(size), 0, name);
+    g_heaps.add(*holder);
+    TAVO_LOG(kCountTag, TAVO_LOG_INFO, "uiCnt++ = %lu pid = %lu \n", static_cast<unsigned long>(g_heaps.count()),
+             static_cast<unsigned long>(getpid()));
+    TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Shared Memory name = %s\n", name);
+    record->iKey = key;
+    record->iSize = size;
+    record->uiUseCount = 1;
+    record->pvObject = holder;
+    ++m_pBlocks->uiCount;
+    TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Exiting\n");
+    return *holder;
+}
+
+int TavoOsalService::delete_shared_mem(int key) {
+    TAVO_LOG(kTag, TAVO_LOG_TRACE, "++Entered\n");
+    TAVO_LOG(kTag, TAVO_LOG_VERBOSE, "Param1: iKey = %d\n", key);
+    // Blocks of negative keys can be made but not deleted. Callers depend on the asymmetry.
+    if (key <= 0) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid input parameters\n");
+        return TAVO_FAILURE;
+    }
+    sp<IMemoryHeap> heap, last;  // declared first: unmapped without the lock
+    const std::lock_guard<std::mutex> lock(tavo::service_lock());
+    if (!hasBlockList()) return -1;
+    KeyRecord* record = findBlock(key, TAVO_LOG_INFO);
+    if (record == nullptr) {
+        TAVO_LOG(kTag, TAVO_LOG_INFO, "Matching node not found\n");
+        return 0;
+    }
+    if (--record->uiUseCount > 0) {
+        TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Memory is still using by some other process!!\n");
+        return 0;
+    }
+    sp<IMemoryHeap>* holder = holderOf(record);
+    if (holder == nullptr || *holder == nullptr) {
+        TAVO_LOG(kTag, TAVO_LOG_ERROR, "Unexpected error !! Failed to free shared memory\n");
+        return -1;
+    }
+    heap = *holder;
+    delete holder;
+    last = forgetHeap(heap->getBase());
+
+    tavo_osal_list_delete(&record->stLink);
+    free(record);
+    --m_pBlocks->uiCount;
+    return 0;
+}
+
+// Takes a heap out of the process's table.
+sp<IMemoryHeap> TavoOsalService::forgetHeap(void* pvBase) {
+    uint32_t first_word = 0;
+    if (pvBase != MAP_FAILED) memcpy(&first_word, pvBase, sizeof first_word);
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "Memory value returned = %p.\n", pvBase);
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "base=%p Data=0x%x\n", pvBase, first_word);
+    sp<IMemoryHeap> heap = g_heaps.remove(pvBase);
+    TAVO_LOG(kCountTag, TAVO_LOG_INFO, "uiCnt-- = %lu pid = %lu \n", static_cast<unsigned long>(g_heaps.count()),
+             static_cast<unsigned long>(getpid()));
+    return heap;
+}
+
+int TavoOsalService::TavoOsalServiceDeInit() {
+    TAVO_LOG(kTag, TAVO_LOG_TRACE, "++Entered\n");
+    const std::lock_guard<std::mutex> lock(tavo::service_lock());
+    if (m_pBlocks != nullptr) {
+        TAVO_LOG(kTag, TAVO_LOG_DEBUG, kComparing);
+        for (TAVO_ListNode* link = m_pBlocks->pHead->next; link != m_pBlocks->pHead;) {
+            KeyRecord* record = recordOf(link);
+            link = link->next;
+            TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Trying with node %p.\n", static_cast<void*>(record));
+            delete holderOf(record);
+            tavo_osal_list_delete(&record->stLink);
+            TAVO_LOG(kTag, TAVO_LOG_INFO, "Freeing node ptr=%p.\n", static_cast<void*>(record));
+            free(record);
+            --m_pBlocks->uiCount;
+        }
+        TAVO_LOG(kTag, TAVO_LOG_INFO, "Freeing shared memory list head node ptr.\n");
+        tavo_osal_mem_free(m_pBlocks->pHead);
+    }
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "Freeing shared memory list info ptr.\n");
+    tavo_osal_mem_free(m_pBlocks);
+    m_pBlocks = nullptr;
+
+    for (uint32_t i = 0; i < m_uiQueueCount; ++i) {
+        delete static_cast<TAVO_MessageQueue*>(m_ppQueues[i]->pvObject);
+        free(m_ppQueues[i]);
+    }
+    free(m_ppQueues);
+    m_ppQueues = nullptr;
+    m_uiQueueRoom = 0;
+    m_uiQueueCount = 0;
+    TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
+    return 0;
+}
+
+}  // namespace android
