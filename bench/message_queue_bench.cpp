@@ -1,7 +1,6 @@
 // The message queue against a bare pipe of the default size that carries the same frames: one write from one buffer
 // with room for the length in front, two reads. Both sides write each message before they send it, as programs do: a
 // buffer that nobody touches between two sends would flatter the side that copies nothing.
-#include <sched.h>
 #include <signal.h>
 #include <sys/prctl.h>
 #include <sys/wait.h>
@@ -14,12 +13,15 @@
 #include <string>
 #include <vector>
 
+#include "cpus.h"
 #include "ipc/TAVO_MessageQueue.h"
 #include "paired.h"
 
 namespace {
 
+using tavo::bench::Cpus;
 using tavo::bench::Pair;
+using tavo::bench::run_on;
 
 constexpr uint32_t kLargest = 409600;
 constexpr double kOverhead = 1.06;         // of the bare time, where both sides share one CPU
@@ -81,28 +83,6 @@ private:
     unsigned char value_ = 0;
     std::vector<unsigned char> message_ = std::vector<unsigned char>(kLargest);
     std::vector<unsigned char> received_ = std::vector<unsigned char>(kLargest);
-};
-
-void run_on(int cpu) {
-    cpu_set_t set;
-    CPU_ZERO(&set);
-    CPU_SET(cpu, &set);
-    if (sched_setaffinity(0, sizeof set, &set) != 0) fail("sched_setaffinity");
-}
-
-// The first and the last CPU that this program may use.
-struct Cpus {
-    int first = -1;
-    int last = -1;
-    Cpus() {
-        cpu_set_t set;
-        if (sched_getaffinity(0, sizeof set, &set) != 0) fail("sched_getaffinity");
-        for (int cpu = 0; cpu < CPU_SETSIZE; ++cpu) {
-            if (!CPU_ISSET(cpu, &set)) continue;
-            if (first < 0) first = cpu;
-            last = cpu;
-        }
-    }
 };
 
 const Cpus& cpus() {

@@ -4,6 +4,8 @@
 #include <binder/Parcel.h>
 #include <fcntl.h>
 
+#include <new>
+
 #include "log/module_log.h"
 
 namespace android {
@@ -29,11 +31,17 @@ constexpr int kLowestDescriptor = 1;
 // an empty reply yields 0, no heap and no descriptor.
 void request(IBinder* service, uint32_t code, Parcel* reply, int key, const int* size = nullptr) {
     TAVO_TRACE_SCOPE(kTag);
+    // The one operation that says more, and it names another one. Users' log filters know it by that.
+    if (code == kDeleteSharedMem) TAVO_LOG(kTag, TAVO_LOG_INFO, "Key received at get_shared_memory is %d", key);
     Parcel data;
     data.writeInterfaceToken(ITavoBinder::descriptor);
     data.writeInt32(key);
     if (size != nullptr) data.writeInt32(*size);
-    service->transact(code, data, reply, 0);
+    try {
+        service->transact(code, data, reply, 0);
+    } catch (const std::bad_alloc&) {
+        // As any other failure on the way: the reply is empty.
+    }
 }
 
 int requestInt(IBinder* service, uint32_t code, int key) {
@@ -81,14 +89,14 @@ int BpTavoBinder::delete_message_queue(int key) { return requestInt(remote(), kD
 sp<IMemoryHeap> BpTavoBinder::get_shared_mem(int key, int size) {
     Parcel reply;
     request(remote(), kGetSharedMem, &reply, key, &size);
-    return IMemoryHeap::asInterface(reply.readStrongBinder());
+    try {
+        return IMemoryHeap::asInterface(reply.readStrongBinder());
+    } catch (const std::bad_alloc&) {
+        return nullptr;
+    }
 }
 
-int BpTavoBinder::delete_shared_mem(int key) {
-    // The text names the other operation, and callers' log filters know it by that.
-    TAVO_LOG(kTag, TAVO_LOG_INFO, "Key received at get_shared_memory is %d", key);
-    return requestInt(remote(), kDeleteSharedMem, key);
-}
+int BpTavoBinder::delete_shared_mem(int key) { return requestInt(remote(), kDeleteSharedMem, key); }
 
 status_t BnTavoBinder::onTransact(uint32_t code, const Parcel& data, Parcel* reply, uint32_t flags) {
     TAVO_LOG(kTag, TAVO_LOG_TRACE, "++Entered\n");

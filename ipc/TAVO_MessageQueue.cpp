@@ -23,23 +23,13 @@ constexpr size_t kMaxMessage = TAVO_MessageQueue::MAX_MESSAGE_SIZE;
 constexpr int32_t kNoDevice = -19;
 constexpr int32_t kInvalidArgument = -22;
 
-// Traces a method's entry and each of its exits.
-class Trace {
-public:
-    explicit Trace(const char* entered = "++Entered\n") { TAVO_LOG(kTag, TAVO_LOG_TRACE, "%s", entered); }
-    // A thread may be cancelled, which unwinds its stack, while it writes the log.
-    ~Trace() noexcept(false) { TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n"); }
-    Trace(const Trace&) = delete;
-    Trace& operator=(const Trace&) = delete;
-};
-
 struct MemoryFree {
     void operator()(unsigned char* block) const { tavo_osal_mem_free(block); }
 };
 
 // get, for a buffer of room bytes that a longer message overwrites from its start.
 int32_t receive(TAVO_MessageQueue& queue, unsigned char* buffer, size_t room, unsigned int* size) {
-    const Trace trace("++Entered at get () \n");
+    TAVO_TRACE_SCOPE_AS(kTag, "++Entered at get () \n");
     // The name has no terminator when it fills its field.
     if (buffer == nullptr || size == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_DEBUG, "msg is NULL for Service(%.64s)", queue.acServiceName);
@@ -98,7 +88,7 @@ void replace(int32_t& descriptor, int by) {
 namespace android {
 
 TAVO_MessageQueue::TAVO_MessageQueue() : iReadFd(0), iWriteFd(0), bMsg(0), uiRoomFor(0), uiId(0), acServiceName{} {
-    const Trace trace;
+    TAVO_TRACE_SCOPE(kTag);
     int ends[2] = {0, 0};
     const int result = tavo::make_pipe(ends);
     if (result != 0) {
@@ -111,14 +101,14 @@ TAVO_MessageQueue::TAVO_MessageQueue() : iReadFd(0), iWriteFd(0), bMsg(0), uiRoo
 }
 
 TAVO_MessageQueue::~TAVO_MessageQueue() {
-    const Trace trace;
+    TAVO_TRACE_SCOPE(kTag);
     // 0 is closed here, whatever it stands for elsewhere. Callers depend on it.
     if (iReadFd >= 0) close(iReadFd);
     if (iWriteFd >= 0) close(iWriteFd);
 }
 
 int32_t TAVO_MessageQueue::tavo_android_msg_queue_put(unsigned char* pbMsg, unsigned int uiSize) {
-    const Trace trace;
+    TAVO_TRACE_SCOPE(kTag);
     if (pbMsg == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_INFO, "pbMsg is NULL");
         return TAVO_INVALID_PARAM;
@@ -156,7 +146,7 @@ int32_t TAVO_MessageQueue::tavo_android_msg_queue_get(unsigned char* pbMsg, unsi
 }
 
 uint8_t TAVO_MessageQueue::tavo_android_msg_queue_is_empty() {
-    const Trace trace;
+    TAVO_TRACE_SCOPE(kTag);
     if (iReadFd == 0) {
         TAVO_LOG(kTag, TAVO_LOG_INFO, "read descriptor not initialized for message queue\n");
         return READ_END_NOT_INITIALIZED;
@@ -188,7 +178,7 @@ void TAVO_MessageQueue::tavo_android_msg_queue_clear() {
 
 int32_t TAVO_MessageQueue::tavo_android_msg_queue_wait_for_msg(TAVO_MessageQueue* q1, TAVO_MessageQueue* q2,
                                                                TAVO_MessageQueue* q3, int iTimeout) {
-    const Trace trace;
+    TAVO_TRACE_SCOPE(kTag);
     if (q1 == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_INFO, "queue1 poINT32er is NULL\n");
         return kInvalidArgument;
@@ -216,7 +206,7 @@ int32_t TAVO_MessageQueue::tavo_android_msg_queue_wait_for_msg(TAVO_MessageQueue
 }
 
 TAVO_Status TAVO_MessageQueue::tavo_android_get_num_of_messages(int* piCount) {
-    const Trace trace;
+    TAVO_TRACE_SCOPE(kTag);
     if (piCount == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid pointer passed piCount\n");
         return TAVO_INVALID_PARAM;
@@ -232,12 +222,12 @@ TAVO_Status TAVO_MessageQueue::tavo_android_get_num_of_messages(int* piCount) {
 }
 
 void TAVO_MessageQueue::tavo_android_msg_queue_set_fd(int iFd) {
-    const Trace trace;
+    TAVO_TRACE_SCOPE(kTag);
     replace(iReadFd, iFd);
 }
 
 void TAVO_MessageQueue::tavo_android_msg_queue_set_write_fd(int iFd) {
-    const Trace trace;
+    TAVO_TRACE_SCOPE(kTag);
     replace(iWriteFd, iFd);
     __atomic_store_n(&uiRoomFor, static_cast<uint8_t>(0), __ATOMIC_RELAXED);
 }

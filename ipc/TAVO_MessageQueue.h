@@ -44,8 +44,9 @@ public:
     TAVO_MessageQueue& operator=(const TAVO_MessageQueue&) = delete;
 
     /**
-     * Sends one message. Blocks while the pipe is full, unless the write end is non-blocking; a frame that is partly
-     * in the pipe is always finished, whatever interrupts it.
+     * Sends one message. Blocks while the pipe is full, unless the write end is non-blocking. A frame that is partly
+     * in the pipe is finished in spite of interruptions; a non-blocking write end waits up to one second for each
+     * part, then fails with EAGAIN and leaves the part in the pipe.
      *
      * @param pbMsg  the message; read only
      * @param uiSize its bytes, 0 to #MAX_MESSAGE_SIZE
@@ -106,13 +107,14 @@ public:
     /** @return the write end, still owned by the queue */
     int tavo_android_msg_queue_get_write_fd();
 
-    /** @return 0 */
+    /** Stores #uiId. @return 0 */
     int32_t tavo_android_msg_queue_set_id(unsigned int uiId);
     /** Copies at most 64 bytes; a longer name, or one of 64, is kept without a terminator.
      *  @return 0; #TAVO_INVALID_PARAM: pcName is null */
     int32_t tavo_android_msg_queue_set_service_name(unsigned char* pcName);
     /** @return #acServiceName, 64 bytes that need not hold a terminator */
     char* tavo_android_msg_queue_get_service_name();
+    /** Stores #bMsg. */
     void tavo_android_msg_queue_set_msg(unsigned char bMsg);
 
     /** False right after construction when the pipe could not be made. */

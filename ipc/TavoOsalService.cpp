@@ -7,6 +7,7 @@
 #include <memory>
 #include <mutex>
 #include <new>
+#include <utility>
 
 #include "ipc/TAVO_MessageQueue.h"
 #include "ipc/service_lock.h"
@@ -89,6 +90,28 @@ int TavoOsalService::TavoOsalServiceInit(unsigned int uiMaxNumMsgQueues, unsigne
     return itemsLeft;
 }
 
+int TavoOsalService::TavoOsalServiceDeInit() {
+    TAVO_LOG(kTag, TAVO_LOG_TRACE, "++Entered\n");
+    std::unique_lock<std::mutex> lock(tavo::service_lock());
+    BlockList* blocks = std::exchange(m_pBlocks, nullptr);
+    KeyRecord** queues = std::exchange(m_ppQueues, nullptr);
+    const uint32_t queue_count = std::exchange(m_uiQueueCount, 0U);
+    m_uiQueueRoom = 0;
+    lock.unlock();
+
+    if (blocks != nullptr && blocks->pHead != nullptr) freeBlocks(blocks);
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "Freeing shared memory list info ptr.\n");
+    tavo_osal_mem_free(blocks);
+
+    for (uint32_t i = 0; i < queue_count; ++i) {
+        delete static_cast<TAVO_MessageQueue*>(queues[i]->pvObject);
+        free(queues[i]);
+    }
+    free(queues);
+    TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
+    return 0;
+}
+
 int TavoOsalService::create_message_queue(int key) {
     if (key == 0) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid key!!\n");
@@ -108,7 +131,7 @@ int TavoOsalService::create_message_queue(int key) {
 // A queue that cannot be made, for want of descriptors or memory, leaves the table as it was.
 int TavoOsalService::addQueue(int key) {
     if (m_uiQueueCount == m_uiQueueRoom) {
-        auto** grown = static_cast<KeyRecord**>(realloc(m_ppQueues, m_uiQueueRoom * 2 * sizeof(KeyRecord)));
+        auto** grown = static_cast<KeyRecord**>(realloc(m_ppQueues, size_t{m_uiQueueRoom} * 2 * sizeof(KeyRecord*)));
         if (grown == nullptr) return -1;
         m_ppQueues = grown;
         m_uiQueueRoom *= 2;

@@ -27,7 +27,8 @@ public:
     ~TavoOsalService() override;
 
     /**
-     * Builds both tables and sets the key index file back to 1.
+     * Builds both tables and sets the key index file back to 1. Called once, before the object is published; a second
+     * call frees the tables of the first.
      * @param uiMaxNumMsgQueues        room in the queue table to begin with; it grows. Not 0
      * @param uiMaxNumSharedMemBlocks  advisory: reaching it is only logged. Not 0
      * @return 0, also when the index file cannot be opened: there is no queue table then, and every
@@ -58,7 +59,7 @@ private:
         TAVO_ListNode stLink;  // of a block
     };
     struct BlockList {
-        TAVO_ListNode* pHead;
+        TAVO_ListNode* pHead;  // null while there is no list
         uint32_t uiCount;
         uint32_t uiMaximum;  // only said in the log
     };
@@ -69,15 +70,15 @@ private:
     TAVO_LOCAL int addQueue(int key);
     TAVO_LOCAL KeyRecord* findBlock(int key, uint32_t uiMatchLevel) const;
     TAVO_LOCAL sp<IMemoryHeap> addBlock(int key, int size);
-    TAVO_LOCAL static sp<IMemoryHeap> forgetHeap(void* pvBase);
     TAVO_LOCAL bool hasBlockList() const;
+    TAVO_LOCAL static void freeBlocks(BlockList* pBlocks);
     TAVO_LOCAL static KeyRecord* recordOf(TAVO_ListNode* pLink);
     TAVO_LOCAL static sp<IMemoryHeap>* holderOf(KeyRecord* pRecord);
 
     KeyRecord** m_ppQueues = nullptr;  // null while there is no table; its used entries have no holes
     uint32_t m_uiQueueCount = 0;
-    uint32_t m_uiQueueRoom = 0;
     BlockList* m_pBlocks = nullptr;
+    uint32_t m_uiQueueRoom = 0;
 };
 
 }  // namespace android

@@ -7,11 +7,11 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <memory>
 #include <mutex>
 #include <new>
 #include <vector>
 
-#include "ipc/TAVO_MessageQueue.h"
 #include "ipc/TavoOsalService.h"
 #include "ipc/service_lock.h"
 #include "log/module_log.h"
@@ -60,28 +60,56 @@ private:
 
 HeapTable g_heaps;
 
+void logHeapCount(const char* change) {
+    TAVO_LOG(kCountTag, TAVO_LOG_INFO, "uiCnt%s = %lu pid = %lu \n", change,
+             static_cast<unsigned long>(g_heaps.count()), static_cast<unsigned long>(getpid()));
+}
+
+// A new heap, entered in the table, in a holder of its own. Null when there is no memory for any of it; whether the
+// heap could be mapped is not looked at.
+std::unique_ptr<sp<IMemoryHeap>> makeHeap(int size, const char* name) {
+    try {
+        const sp<IMemoryHeap> heap = new MemoryHeapBase(static_cast<size_t>(size), 0, name);
+        auto holder = std::make_unique<sp<IMemoryHeap>>(heap);
+        g_heaps.add(heap);
+        return holder;
+    } catch (const std::bad_alloc&) {
+        return nullptr;
+    }
+}
+
+// Takes a heap out of the table and says what it held.
+sp<IMemoryHeap> forgetHeap(const void* base) {
+    uint32_t first_word = 0;
+    if (base != MAP_FAILED) memcpy(&first_word, base, sizeof first_word);
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "Memory value returned = %p.\n", base);
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "base=%p Data=0x%x\n", base, first_word);
+    sp<IMemoryHeap> heap = g_heaps.remove(base);
+    logHeapCount("--");
+    return heap;
+}
+
 }  // namespace
 
 int TavoOsalService::initBlockList(unsigned int uiMaximum) {
-    auto* blocks = static_cast<BlockList*>(tavo_osal_mem_malloc(sizeof(BlockList)));
-    if (blocks != nullptr) {
-        blocks->uiCount = 0;
-        blocks->uiMaximum = uiMaximum;
-        blocks->pHead = static_cast<TAVO_ListNode*>(tavo_osal_mem_malloc(sizeof(TAVO_ListNode)));
+    m_pBlocks = static_cast<BlockList*>(tavo_osal_mem_malloc(sizeof(BlockList)));
+    if (m_pBlocks != nullptr) {
+        *m_pBlocks = {};
+        m_pBlocks->uiMaximum = uiMaximum;
+        // Without a head the record stays, and says that there is no list, until it is freed with the service.
+        m_pBlocks->pHead = static_cast<TAVO_ListNode*>(tavo_osal_mem_malloc(sizeof(TAVO_ListNode)));
     }
-    if (blocks == nullptr || blocks->pHead == nullptr) {
+    if (m_pBlocks == nullptr || m_pBlocks->pHead == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "ERROR in malloc::\n");
-        tavo_osal_mem_free(blocks);
         return TAVO_NO_MEMORY;
     }
-    tavo_osal_init_list_head(blocks->pHead);
+    tavo_osal_init_list_head(m_pBlocks->pHead);
     TAVO_LOG(kTag, TAVO_LOG_INFO, "Shared memory list head node allocation done.\n");
-    m_pBlocks = blocks;
     return TAVO_SUCCESS;
 }
 
 bool TavoOsalService::hasBlockList() const {
-    if (m_pBlocks != nullptr) return true;
+    if (m_pBlocks != nullptr && m_pBlocks->pHead != nullptr) return true;
     TAVO_LOG(kTag, TAVO_LOG_ERROR, "ERROR::Memory list still not initialized. This is fatal.\n");
     return false;
 }
@@ -135,30 +163,25 @@ sp<IMemoryHeap> TavoOsalService::addBlock(int key, int size) {
         // Advisory: the block is made all the same.
         TAVO_LOG(kTag, TAVO_LOG_INFO, "Max number of memory blocks allocated already\n");
     }
-    auto* record = static_cast<KeyRecord*>(calloc(1, sizeof(KeyRecord)));
-    auto* holder = new (std::nothrow) sp<IMemoryHeap>;
-    if (record == nullptr || holder == nullptr) {
-        free(record);
-        delete holder;
-        return nullptr;
-    }
-    tavo_osal_add_to_queue(&record->stLink, m_pBlocks->pHead);
-    TAVO_LOG(kTag, TAVO_LOG_DEBUG, "New node added %p.\n", static_cast<void*>(record));
-
     char name[64];
     snprintf(name, sizeof name, "SharedMemory_%d\n", key);  // the newline is part of the name, and kept
-    *holder = new MemoryHeapBase(static_cast<size_t>(size), 0, name);
-    g_heaps.add(*holder);
-    TAVO_LOG(kCountTag, TAVO_LOG_INFO, "uiCnt++ = %lu pid = %lu \n", static_cast<unsigned long>(g_heaps.count()),
-             static_cast<unsigned long>(getpid()));
-    TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Shared Memory name = %s\n", name);
+    auto* record = static_cast<KeyRecord*>(calloc(1, sizeof(KeyRecord)));
+    auto holder = record != nullptr ? makeHeap(size, name) : nullptr;
+    if (holder == nullptr) {
+        free(record);
+        return nullptr;
+    }
     record->iKey = key;
     record->iSize = size;
     record->uiUseCount = 1;
-    record->pvObject = holder;
+    record->pvObject = holder.release();
+    tavo_osal_add_to_queue(&record->stLink, m_pBlocks->pHead);
     ++m_pBlocks->uiCount;
+    TAVO_LOG(kTag, TAVO_LOG_DEBUG, "New node added %p.\n", static_cast<void*>(record));
+    logHeapCount("++");
+    TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Shared Memory name = %s\n", name);
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Exiting\n");
-    return *holder;
+    return *holderOf(record);
 }
 
 int TavoOsalService::delete_shared_mem(int key) {
@@ -196,50 +219,20 @@ int TavoOsalService::delete_shared_mem(int key) {
     return 0;
 }
 
-// Takes a heap out of the process's table.
-sp<IMemoryHeap> TavoOsalService::forgetHeap(void* pvBase) {
-    uint32_t first_word = 0;
-    if (pvBase != MAP_FAILED) memcpy(&first_word, pvBase, sizeof first_word);
-    TAVO_LOG(kTag, TAVO_LOG_INFO, "Memory value returned = %p.\n", pvBase);
-    TAVO_LOG(kTag, TAVO_LOG_INFO, "base=%p Data=0x%x\n", pvBase, first_word);
-    sp<IMemoryHeap> heap = g_heaps.remove(pvBase);
-    TAVO_LOG(kCountTag, TAVO_LOG_INFO, "uiCnt-- = %lu pid = %lu \n", static_cast<unsigned long>(g_heaps.count()),
-             static_cast<unsigned long>(getpid()));
-    return heap;
-}
-
-int TavoOsalService::TavoOsalServiceDeInit() {
-    TAVO_LOG(kTag, TAVO_LOG_TRACE, "++Entered\n");
-    const std::lock_guard<std::mutex> lock(tavo::service_lock());
-    if (m_pBlocks != nullptr) {
-        TAVO_LOG(kTag, TAVO_LOG_DEBUG, kComparing);
-        for (TAVO_ListNode* link = m_pBlocks->pHead->next; link != m_pBlocks->pHead;) {
-            KeyRecord* record = recordOf(link);
-            link = link->next;
-            TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Trying with node %p.\n", static_cast<void*>(record));
-            delete holderOf(record);
-            tavo_osal_list_delete(&record->stLink);
-            TAVO_LOG(kTag, TAVO_LOG_INFO, "Freeing node ptr=%p.\n", static_cast<void*>(record));
-            free(record);
-            --m_pBlocks->uiCount;
-        }
-        TAVO_LOG(kTag, TAVO_LOG_INFO, "Freeing shared memory list head node ptr.\n");
-        tavo_osal_mem_free(m_pBlocks->pHead);
+void TavoOsalService::freeBlocks(BlockList* pBlocks) {
+    TAVO_LOG(kTag, TAVO_LOG_DEBUG, kComparing);
+    for (TAVO_ListNode* link = pBlocks->pHead->next; link != pBlocks->pHead;) {
+        KeyRecord* record = recordOf(link);
+        link = link->next;
+        TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Trying with node %p.\n", static_cast<void*>(record));
+        delete holderOf(record);
+        tavo_osal_list_delete(&record->stLink);
+        TAVO_LOG(kTag, TAVO_LOG_INFO, "Freeing node ptr=%p.\n", static_cast<void*>(record));
+        free(record);
+        --pBlocks->uiCount;
     }
-    TAVO_LOG(kTag, TAVO_LOG_INFO, "Freeing shared memory list info ptr.\n");
-    tavo_osal_mem_free(m_pBlocks);
-    m_pBlocks = nullptr;
-
-    for (uint32_t i = 0; i < m_uiQueueCount; ++i) {
-        delete static_cast<TAVO_MessageQueue*>(m_ppQueues[i]->pvObject);
-        free(m_ppQueues[i]);
-    }
-    free(m_ppQueues);
-    m_ppQueues = nullptr;
-    m_uiQueueRoom = 0;
-    m_uiQueueCount = 0;
-    TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
-    return 0;
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "Freeing shared memory list head node ptr.\n");
+    tavo_osal_mem_free(pBlocks->pHead);
 }
 
 }  // namespace android

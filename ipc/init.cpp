@@ -6,9 +6,14 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <new>
+
 #include "ipc/TavoOsalService.h"
 #include "ipc/service_location.h"
 #include "log/module_log.h"
+
+using android::sp;
+using android::TavoOsalService;
 
 namespace {
 
@@ -33,6 +38,15 @@ bool leave_marker(const char* path) {
     return true;
 }
 
+// Published whether its tables could be built or not: clients are answered with its failures.
+void publish(unsigned int max_queues, unsigned int max_blocks) {
+    const sp<TavoOsalService> service = new TavoOsalService;
+    service->TavoOsalServiceInit(max_queues, max_blocks);
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "Starting the service\n");
+    android::defaultServiceManager()->addService(android::String16(tavo::kServiceName), service, false);
+    android::ProcessState::self()->startThreadPool();
+}
+
 }  // namespace
 
 TAVO_Status tavo_osal_init(unsigned int uiMaxNumMsgQueues, unsigned int uiMaxNumSharedMemBlocks) {
@@ -44,12 +58,11 @@ TAVO_Status tavo_osal_init(unsigned int uiMaxNumMsgQueues, unsigned int uiMaxNum
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "creating service file  %s \n", marker.text);
     if (!leave_marker(marker.text)) return TAVO_FAILURE;
 
-    // Published whether its tables could be built or not: clients are answered with its failures.
-    const android::sp<android::TavoOsalService> service = new android::TavoOsalService;
-    service->TavoOsalServiceInit(uiMaxNumMsgQueues, uiMaxNumSharedMemBlocks);
-    TAVO_LOG(kTag, TAVO_LOG_INFO, "Starting the service\n");
-    android::defaultServiceManager()->addService(android::String16(tavo::kServiceName), service, false);
-    android::ProcessState::self()->startThreadPool();
+    try {
+        publish(uiMaxNumMsgQueues, uiMaxNumSharedMemBlocks);
+    } catch (const std::bad_alloc&) {
+        return TAVO_NO_MEMORY;
+    }
     TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
     return TAVO_SUCCESS;
 }

@@ -1,6 +1,7 @@
 #include "tavo_osal/msg_queue.h"
 
 #include <fcntl.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -14,6 +15,9 @@
 #include "ipc/service_lookup.h"
 #include "log/module_log.h"
 
+using android::IBinder;
+using android::ITavoBinder;
+using android::sp;
 using android::TAVO_MessageQueue;
 
 namespace {
@@ -40,17 +44,39 @@ int key_of(const char* text) {
     return static_cast<int>(std::clamp<long long>(strtoll(name, nullptr, 10), INT32_MIN, INT32_MAX));
 }
 
+// One use of a key in the service, given back unless it is kept.
+class Use {
+public:
+    // Attaching to a queue and creating it are one call. What it says only tells whether the use was counted: a queue
+    // that is not there has no descriptors.
+    Use(const sp<ITavoBinder>& service, int key)
+        : service_(service), key_(key), counted_(service->create_message_queue(key) >= 0) {}
+    // A thread may be cancelled, which unwinds its stack, while it calls the service.
+    ~Use() noexcept(false) {
+        if (counted_) service_->delete_message_queue(key_);
+    }
+    Use(const Use&) = delete;
+    Use& operator=(const Use&) = delete;
+    void keep() { counted_ = false; }
+
+private:
+    const sp<ITavoBinder>& service_;
+    const int key_;
+    bool counted_;
+};
+
 // The proxy's descriptors belong to its caller; the service in this very process answers with its own.
-int own(const android::sp<android::ITavoBinder>& service, int descriptor) {
-    const bool is_local = android::IInterface::asBinder(service)->localBinder() != nullptr;
-    return is_local && descriptor >= 0 ? fcntl(descriptor, F_DUPFD_CLOEXEC, kLowestDescriptor) : descriptor;
+int own(const sp<ITavoBinder>& service, int descriptor) {
+    const sp<IBinder> binder = android::IInterface::asBinder(service);
+    const bool is_local = binder->queryLocalInterface(ITavoBinder::descriptor) != nullptr;
+    return is_local ? fcntl(descriptor, F_DUPFD_CLOEXEC, kLowestDescriptor) : descriptor;
 }
 
 // What a failed transfer is called: a queue that was removed has a code of its own.
 TAVO_Status transfer_failure(TAVO_Status other) { return errno == EIDRM ? TAVO_MQ_NOT_AVAILABLE : other; }
 
 // Gives a fresh queue object the descriptors of the service's queue.
-TAVO_Status connect(TAVO_MessageQueue& queue, const android::sp<android::ITavoBinder>& service, int key) {
+TAVO_Status connect(TAVO_MessageQueue& queue, const sp<ITavoBinder>& service, int key) {
     TAVO_LOG(kTag, TAVO_LOG_ERROR, "%s () : getting fd for %d \n", kAttachSignature, key);
     const int read_end = own(service, service->get_fd(key));
     TAVO_LOG(kTag, TAVO_LOG_ERROR, "%s () GOT FD \n", kAttachSignature);
@@ -96,26 +122,25 @@ TAVO_Status tavo_msg_queue_sender_init(TAVO_CHAR* pcServiceName, TAVO_INT64* piM
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid pointer passed piMqId\n");
         return TAVO_MQ_INVALID_POINTER;
     }
-    const android::sp<android::ITavoBinder> service = tavo_osal_get_service(pcServiceName);
+    const sp<ITavoBinder> service = tavo_osal_get_service(pcServiceName);
     if (service == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "tavo_osal_get_service() failed\n");
         return kServiceUnreachable;
     }
     const int key = key_of(pcServiceName);
-    // Attaching to a queue and creating it are one call. What it says is not looked at: a queue that is not
-    // there has no descriptors.
-    const bool counted = service->create_message_queue(key) >= 0;
+    Use use(service, key);
     std::unique_ptr<TAVO_MessageQueue> queue(new (std::nothrow) TAVO_MessageQueue);
-    const TAVO_Status status = queue != nullptr ? connect(*queue, service, key) : TAVO_NO_MEMORY;
-    if (status != TAVO_SUCCESS) {
-        if (counted) service->delete_message_queue(key);  // the use that nobody will drop
-        return status;
-    }
+    if (queue == nullptr) return TAVO_NO_MEMORY;
+    // Without a temporary pipe there is nothing for the received descriptors, or the destructor, to close.
+    if (!queue->has_pipe()) queue->disown_descriptors();
+    const TAVO_Status status = connect(*queue, service, key);
+    if (status != TAVO_SUCCESS) return status;
     queue->tavo_android_msg_queue_set_service_name(reinterpret_cast<unsigned char*>(pcServiceName));
     *piMqId = handle_of(queue.get());
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Message queue object returned: addr %p  :  service %s\n",
              static_cast<void*>(queue.get()), pcServiceName);
-    queue.release();
+    static_cast<void>(queue.release());  // the handle's now
+    use.keep();
     return TAVO_SUCCESS;
 }
 
@@ -147,7 +172,7 @@ TAVO_Status tavo_msg_queue_destroy(TAVO_INT64 iMqId) {
     TAVO_MessageQueue* queue = queue_of(iMqId);
     char name[sizeof queue->acServiceName + 1] = {};
     memcpy(name, queue->tavo_android_msg_queue_get_service_name(), sizeof queue->acServiceName);
-    const android::sp<android::ITavoBinder> service = tavo_osal_get_service(name);
+    const sp<ITavoBinder> service = tavo_osal_get_service(name);
     if (service == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "tavo_osal_get_service() failed\n");
         return TAVO_FAILURE;

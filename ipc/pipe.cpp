@@ -19,13 +19,13 @@ constexpr int kLargestPipe = 1 << 20;
 
 bool is_interruption(int error) { return error == EINTR || error == EAGAIN; }
 
-// Waits until more can be read, or the writers have gone, which the next read tells.
-bool more_arrives(int fd) {
+// Waits until more can be read or written (events), or the other side has gone, which the next call tells.
+bool becomes_ready(int fd, short events) {
     using std::chrono::steady_clock;
     const auto deadline = steady_clock::now() + kPatience;
     auto left = kPatience;
     for (;;) {
-        pollfd slot = {fd, POLLIN, 0};
+        pollfd slot = {fd, events, 0};
         const int ready = poll(&slot, 1, static_cast<int>(left.count()));
         if (ready >= 0 || errno != EINTR) return ready > 0;
         // Signals must not make the wait any longer.
@@ -63,12 +63,13 @@ bool write_rest(int fd, const unsigned char* data, size_t length, ssize_t count)
             done += static_cast<size_t>(count);
             if (done == length) return true;
         } else if (done == 0 || !is_interruption(errno)) {
-            // Nothing of the frame is out, or nothing more can get out. To give it up in between would make the
+            // Nothing of the frame is out, or nothing more can get out. To give it up in between could make the
             // reader take the next frame for its rest.
             return false;
-        } else if (errno == EAGAIN) {
-            pollfd slot = {fd, POLLOUT, 0};
-            poll(&slot, 1, -1);
+        } else if (errno == EAGAIN && !becomes_ready(fd, POLLOUT)) {
+            // Nobody reads, and the writer has asked not to be kept.
+            errno = EAGAIN;
+            return false;
         }
         count = write(fd, data + done, length - done);
     }
@@ -86,7 +87,7 @@ ssize_t read_rest(int fd, unsigned char* buffer, size_t room, size_t length, ssi
         if (count == 0 || total == length) return static_cast<ssize_t>(total);
 
         const bool goes_on = count > 0 || ((begun || total > 0) && is_interruption(error));
-        if (!goes_on || !more_arrives(fd)) {
+        if (!goes_on || !becomes_ready(fd, POLLIN)) {
             errno = error;
             return total > 0 ? static_cast<ssize_t>(total) : -1;
         }

@@ -18,7 +18,7 @@ bool write_rest(int fd, const unsigned char* data, size_t length, ssize_t count)
 ssize_t read_rest(int fd, unsigned char* buffer, size_t room, size_t length, ssize_t count, bool begun);
 
 // Writes length bytes, with one write unless the pipe takes less. False and errno when it failed: before the first byte
-// for any reason, later only when no more can ever be written.
+// for any reason, later only when no more can be written, or a non-blocking pipe has had no room for a second.
 inline bool write_all(int fd, const unsigned char* data, size_t length) {
     const ssize_t count = write(fd, data, length);
     return __builtin_expect(count == static_cast<ssize_t>(length), 1) || write_rest(fd, data, length, count);

@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "log/cancel_shield.h"
 #include "log/module_log.h"
 
 uint32_t g_uiMxEnabledLogLevel = TAVO_LOG_WARNING;
@@ -142,6 +143,8 @@ void apply_preference(char* preference, TAVO_LogCallback callback, void* param) 
 void tavo_print_log(uint32_t uiLevel, uint32_t uiModule, int iLine, const TAVO_CHAR* pcTag, const TAVO_CHAR* pcFormat,
                     ...) {
     if (!passes(uiLevel, uiModule)) return;
+    // A thread that vanished from within the log would leave the log's own locks behind, or end the process.
+    const tavo::CancelShield shield;
     // Several messages print the errno of a call made before another line was logged.
     const int saved_errno = errno;
 

@@ -33,22 +33,24 @@ namespace tavo {
 // A function's entry and exit in the trace.
 class ScopeTrace {
 public:
-    ScopeTrace(const char* tag, int line, const char* entered) : tag_(tag), line_(line) {
+    ScopeTrace(const char* tag, int line, const char* entered, const char* exiting = "--Exiting\n")
+        : tag_(tag), line_(line), exiting_(exiting) {
         TAVO_LOG_AT(line_, tag_, TAVO_LOG_TRACE, "%s", entered);
     }
     // A thread may be cancelled, which unwinds its stack, while it writes the log.
-    ~ScopeTrace() noexcept(false) { TAVO_LOG_AT(line_, tag_, TAVO_LOG_TRACE, "--Exiting\n"); }
+    ~ScopeTrace() noexcept(false) { TAVO_LOG_AT(line_, tag_, TAVO_LOG_TRACE, "%s", exiting_); }
     ScopeTrace(const ScopeTrace&) = delete;
     ScopeTrace& operator=(const ScopeTrace&) = delete;
 
 private:
     const char* const tag_;
     const int line_;
+    const char* const exiting_;
 };
 
 }  // namespace tavo
 
 // "++Entered" here and "--Exiting" wherever the function is left.
 #define TAVO_TRACE_SCOPE(tag) TAVO_TRACE_SCOPE_AS(tag, "++Entered\n")
-// For a function that says it entered in words of its own.
-#define TAVO_TRACE_SCOPE_AS(tag, entered) const tavo::ScopeTrace scope_trace((tag), __LINE__, (entered))
+// For a function that says it entered, and maybe that it exits, in words of its own.
+#define TAVO_TRACE_SCOPE_AS(tag, ...) const tavo::ScopeTrace scope_trace((tag), __LINE__, __VA_ARGS__)

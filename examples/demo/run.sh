@@ -1,5 +1,6 @@
 #!/usr/bin/env bash
-# Plays the demo: a server, a receiver and a sender, three processes that share the queue of key 7.
+# Plays the demo. First act: a server, a receiver and a sender, three processes that share the queue of key 7. Second
+# act: a producer and a consumer share the block of key 9, guarded by a semaphore in a file.
 #
 #   run.sh DIRECTORY_OF_THE_PROGRAMS DIRECTORY_FOR_OUTPUT
 set -euo pipefail
@@ -47,14 +48,28 @@ say sender "$(grep '^sent' "$output/sender.out" || echo 'did not finish')"
 say receiver "$(grep -E '^(got|message|the sender)' "$output/receiver.out" || echo 'did not finish')"
 say receiver "$(grep 'a second$' "$output/receiver.out" || echo 'has nothing to report')"
 
-for role in server receiver sender; do
+echo
+echo "Two more, and a shared block:"
+start producer
+producer=$!
+wait_for producer 'holds the semaphore'
+say producer "process $producer fills the 16 MiB block of key 9, holding semaphore 4660"
+start consumer
+consumer=$!
+say consumer "process $consumer waits for the semaphore"
+wait "$consumer" || status=$?
+wait "$producer" || status=$?
+say consumer "$(grep '^saw' "$output/consumer.out" || echo 'did not finish'), and said so through queue 8"
+say producer "$(grep '^wrote' "$output/producer.out" || echo 'did not finish')"
+
+for role in server receiver sender producer consumer; do
     echo
     echo "What the $role logged at levels 1 to 3:"
     sed -n 's/^\(..*\)/  \1/p' "$output/$role.log"
 done
 echo
 if [[ $status -ne 0 ]]; then
-    echo "Messages were lost or damaged: see $output" >&2
+    echo "Messages or blocks were lost or damaged: see $output" >&2
     exit 1
 fi
-echo "All messages arrived intact."
+echo "All messages and the block arrived intact."

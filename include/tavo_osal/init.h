@@ -25,8 +25,9 @@ TAVO_BEGIN_DECLS
  *
  * @param uiMaxNumMsgQueues       queues to make room for at first; more can be created
  * @param uiMaxNumSharedMemBlocks blocks after which the log says that the maximum is reached; more can be created
- * @return #TAVO_SUCCESS; #TAVO_FAILURE: the marker file could not be created, and nothing was published. Failures
- *         to publish and of the service's own initialisation are only logged
+ * @return #TAVO_SUCCESS; #TAVO_FAILURE: the marker file could not be created, and nothing was published;
+ *         #TAVO_NO_MEMORY: no memory for a service object or for publishing it. Failures to publish and of the
+ *         service's own initialisation are only logged
  */
 TAVO_API TAVO_Status tavo_osal_init(unsigned int uiMaxNumMsgQueues, unsigned int uiMaxNumSharedMemBlocks);
 

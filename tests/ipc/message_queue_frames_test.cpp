@@ -323,8 +323,35 @@ TEST(MessageQueueFrames, APutThatWroteAPartIsFinished) {
     EXPECT_EQ(g_calls, 6U);
     ASSERT_EQ(g_waits.size(), 1U);
     EXPECT_EQ(g_waits[0].events, POLLOUT);
-    EXPECT_EQ(g_waits[0].timeout, -1);
+    EXPECT_EQ(g_waits[0].timeout, 1000);
     EXPECT_EQ(get(queue), "a whole message");
+}
+
+TEST(MessageQueueFrames, ANonBlockingPutFailsWhenNoRoomComesForASecond) {
+    TAVO_MessageQueue queue;
+    script({2, -EAGAIN, 1, -EAGAIN});
+    static void* block;
+    static int polls;
+    polls = 0;
+    const LogCapture log;
+    const PlatformHook malloc_hook(
+        kLibrary, "malloc", +[](size_t size) { return block = malloc(size); });
+    const PlatformHook write_hook(kLibrary, "write", scripted_write);
+    const PlatformHook poll_hook(
+        kLibrary, "poll", +[](pollfd* slots, nfds_t count, int timeout) {
+            return ++polls < 2 ? remembering_poll(slots, count, timeout) : expired_poll(slots, count, timeout);
+        });
+    EXPECT_EQ(put(queue, "x"), -1);
+    EXPECT_EQ(errno, EAGAIN);
+    EXPECT_EQ(g_calls, 4U);
+    ASSERT_EQ(g_waits.size(), 2U);
+    for (const Wait& wait : g_waits) {
+        EXPECT_EQ(wait.events, POLLOUT);
+        EXPECT_EQ(wait.timeout, 1000);
+    }
+    EXPECT_TRUE(logged_exactly(log.lines(),
+                               {kEntered, line(3, "write() error: Resource temporarily unavailable\n"), kExiting}));
+    free(block);  // what a failed put is known to leak
 }
 
 TEST(MessageQueueFrames, APutWhoseReaderGoesAwayFails) {

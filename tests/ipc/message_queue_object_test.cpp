@@ -8,6 +8,7 @@
 #include <cstddef>
 #include <cstdlib>
 #include <cstring>
+#include <memory>
 #include <string>
 #include <type_traits>
 #include <vector>
@@ -122,6 +123,23 @@ TEST(MessageQueueDestructor, ClosesBothEnds) {
     }
     EXPECT_TRUE(logged_exactly(log.lines(), {kEntered, kExiting}));
     EXPECT_EQ(count_descriptors(), before);
+}
+
+TEST(MessageQueueDestructor, ClosesTheReadEndFirstAndNothingNegative) {
+    static std::vector<int> closed;
+    closed.clear();
+    auto whole = std::make_unique<TAVO_MessageQueue>();
+    auto half = std::make_unique<TAVO_MessageQueue>();
+    half->tavo_android_msg_queue_set_fd(-1);
+    const std::vector<int> expected = {whole->iReadFd, whole->iWriteFd, half->iWriteFd};
+    const PlatformHook hook(
+        "libtavoosal.so", "close", +[](int fd) {
+            closed.push_back(fd);
+            return close(fd);
+        });
+    whole.reset();
+    half.reset();
+    EXPECT_EQ(closed, expected);
 }
 
 TEST(MessageQueueDestructor, ClosesDescriptorZeroOfAQueueWithoutPipe) {

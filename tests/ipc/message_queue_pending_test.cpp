@@ -183,6 +183,22 @@ TEST(MessageQueueWait, FlagsEveryQueueThatHasData) {
     EXPECT_EQ(any.tavo_android_msg_queue_wait_for_msg(&q1, &q3, nullptr, 1000), 2);
 }
 
+TEST(MessageQueueWait, FlagsTheQueueOfEachSlot) {
+    TAVO_MessageQueue any, q1, q2, q3;
+    for (TAVO_MessageQueue* ready : {&q1, &q2, &q3}) {
+        EXPECT_EQ(put(*ready, "x"), 0);
+        EXPECT_EQ(any.tavo_android_msg_queue_wait_for_msg(&q1, &q2, &q3, 0), 1);
+        for (TAVO_MessageQueue* queue : {&q1, &q2, &q3}) EXPECT_EQ(queue->bMsg, queue == ready ? 1 : 0);
+        EXPECT_EQ(get(*ready), "x");
+    }
+    EXPECT_EQ(put(q1, "1"), 0);
+    EXPECT_EQ(put(q2, "2"), 0);
+    EXPECT_EQ(any.tavo_android_msg_queue_wait_for_msg(&q1, &q2, nullptr, 0), 2);
+    EXPECT_EQ(q1.bMsg, 1);
+    EXPECT_EQ(q2.bMsg, 1);
+    EXPECT_EQ(any.bMsg, 0);
+}
+
 TEST(MessageQueueWait, LeavesTheFlagsOfQueuesWithoutDataAsTheyWere) {
     TAVO_MessageQueue q1, q2;
     q2.tavo_android_msg_queue_set_msg(1);

@@ -44,6 +44,18 @@ void run_on(int cpu) {
     EXPECT_EQ(sched_setaffinity(0, sizeof set, &set), 0);
 }
 
+// Gives the test program its CPUs back.
+class Affinity {
+public:
+    Affinity() { sched_getaffinity(0, sizeof set_, &set_); }
+    ~Affinity() { sched_setaffinity(0, sizeof set_, &set_); }
+    Affinity(const Affinity&) = delete;
+    Affinity& operator=(const Affinity&) = delete;
+
+private:
+    cpu_set_t set_;
+};
+
 // The same messages on both sides: a number, then bytes from a pool, from a place that depends on the number.
 class Messages {
 public:
@@ -116,6 +128,7 @@ class MessageQueueStream : public testing::TestWithParam<Stream> {};
 
 TEST_P(MessageQueueStream, DeliversEveryMessageWhole) {
     const Stream stream = GetParam();
+    const Affinity kept;
     const std::vector<int> cpus = allowed_cpus();
     if (stream.two_cpus && cpus.size() < 2) GTEST_SKIP() << "only one CPU may be used";
     const uint64_t count = stream.count / kShare;

@@ -56,7 +56,7 @@ TEST(Ipv4, RefusesTheMetaAddressInItsPlainSpellingOnly) {
 }
 
 TEST(Ipv4, RefusesTextsOfTheWrongLength) {
-    for (const std::string text : {"", "1", "1.2.3.", "1.2.34", "255.255.255.2555", "1.2.3.4         "}) {
+    for (const std::string text : {"", "1", "1.2.3", "1.2.3.", "1.2.34", "255.255.255.2555", "1.2.3.4         "}) {
         expect_message(text, TAVO_FAILURE, 1, kLength + text + "\n");
     }
     const std::string endless(1000000, '1');

@@ -139,7 +139,7 @@ struct SeenRequest {
 };
 std::vector<SeenRequest> g_requests;
 short g_flags;
-bool g_readable;
+unsigned long g_refused;  // the request that fails; 0 for none
 
 int answer_request(int, unsigned long code, ...) {
     va_list rest;
@@ -148,14 +148,14 @@ int answer_request(int, unsigned long code, ...) {
     va_end(rest);
     g_requests.push_back({code, *request});
     if (code == SIOCGIFFLAGS) request->ifr_flags = g_flags;
-    if (g_readable) return 0;
+    if (code != g_refused) return 0;
     errno = EIO;
     return -1;
 }
 
 TEST(InterfaceState, WritesTheOtherFlagsBackAsRead) {
     const PlatformHook hook(kLibrary, "ioctl", answer_request);
-    g_readable = true;
+    g_refused = 0;
     const struct {
         short read;
         int state;
@@ -184,7 +184,7 @@ std::string bytes_of(const ifreq& request) { return {reinterpret_cast<const char
 
 TEST(InterfaceState, ClearsTheRequestAndCopiesSixteenBytesAtMost) {
     const PlatformHook hook(kLibrary, "ioctl", answer_request);
-    g_readable = true;
+    g_refused = 0;
     g_requests.clear();
     tavo_osal_socket_set_nw_iface_state(7, "0123456789abcdefXYZ", 1);
     tavo_osal_socket_set_nw_iface_state(7, "w", 1);
@@ -197,9 +197,21 @@ TEST(InterfaceState, ClearsTheRequestAndCopiesSixteenBytesAtMost) {
     EXPECT_EQ(bytes_of(g_requests[2].request), bytes_of(expected));
 }
 
+TEST(InterfaceState, ReportsWhateverRefusesTheFlags) {
+    const PlatformHook hook(kLibrary, "ioctl", answer_request);
+    g_refused = SIOCSIFFLAGS;
+    const LogCapture log;
+    EXPECT_EQ(tavo_osal_socket_set_nw_iface_state(7, "eth0", 1), TAVO_FAILURE);
+    EXPECT_EQ(tavo_osal_socket_set_nw_iface_state(7, "eth0", 0), TAVO_FAILURE);
+    EXPECT_EQ(errno, EIO);
+    EXPECT_TRUE(
+        logged_exactly(log.lines(), {{1, kTag, "Error in bringing up the n/w interface(eth0)(" + error_text(EIO)},
+                                     {1, kTag, "Error in bringing down the n/w interface(eth0)(" + error_text(EIO)}}));
+}
+
 TEST(InterfaceState, WritesNothingWhenTheFlagsCannotBeRead) {
     const PlatformHook hook(kLibrary, "ioctl", answer_request);
-    g_readable = false;
+    g_refused = SIOCGIFFLAGS;
     g_requests.clear();
     EXPECT_EQ(tavo_osal_socket_set_nw_iface_state(7, "eth0", 1), TAVO_FAILURE);
     ASSERT_EQ(g_requests.size(), 1U);

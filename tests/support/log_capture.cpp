@@ -37,15 +37,18 @@ std::string LogLine::message() const {
     return separator == std::string::npos ? text : text.substr(separator + 2);
 }
 
+// Atomically, because the library's threads may be reading it.
+static void set_global(uint32_t& global, uint32_t value) { __atomic_store_n(&global, value, __ATOMIC_RELAXED); }
+
 LogCapture::LogCapture(unsigned max_level) : saved_level_(g_uiMxEnabledLogLevel), saved_mask_(g_uiEnabledModuleMask) {
-    g_uiMxEnabledLogLevel = max_level;
+    set_global(g_uiMxEnabledLogLevel, max_level);
     const std::lock_guard<std::mutex> lock(g_mutex);
     g_lines = new std::vector<LogLine>;
 }
 
 LogCapture::~LogCapture() {
-    g_uiMxEnabledLogLevel = saved_level_;
-    g_uiEnabledModuleMask = saved_mask_;
+    set_global(g_uiMxEnabledLogLevel, saved_level_);
+    set_global(g_uiEnabledModuleMask, saved_mask_);
     const std::lock_guard<std::mutex> lock(g_mutex);
     delete g_lines;
     g_lines = nullptr;

@@ -110,11 +110,11 @@ status_t Parcel::writeDupFileDescriptor(int fd) {
 // Takes over the objects that lie wholly in a part of another parcel, whose bytes were copied here.
 status_t Parcel::adoptObjects(const Parcel& from, size_t start, size_t len, size_t to) {
     const binder_size_t* offsets = from.objects();
-    size_t free = start;
+    size_t lowest = start;
     for (size_t i = 0; i < from.objectsCount(); ++i) {
         // No object may reach into the one before it: putting a new descriptor in the one would change the other.
-        if (!fits(offsets[i], free, start + len)) continue;
-        free = static_cast<size_t>(offsets[i]) + sizeof(flat_binder_object);
+        if (!fits(offsets[i], lowest, start + len)) continue;
+        lowest = static_cast<size_t>(offsets[i]) + sizeof(flat_binder_object);
         const size_t offset = static_cast<size_t>(offsets[i]) - start + to;
         flat_binder_object object = objectAt(offset);
         if (object.hdr.type == BINDER_TYPE_FD) {

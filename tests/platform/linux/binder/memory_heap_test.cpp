@@ -178,6 +178,20 @@ TEST(MemoryHeap, ReportsAFailedMapping) {
         "mmap failed: Cannot allocate memory");
 }
 
+int refuse_control(int, int, ...) {
+    errno = EINVAL;
+    return -1;
+}
+
+TEST(MemoryHeap, ReportsFailedSealsAndStaysUsableHere) {
+    const LogCapture log;
+    const PlatformHook hook("libbinder.so", "fcntl", refuse_control);
+    const sp<MemoryHeapBase> heap = new MemoryHeapBase(kPage);
+    EXPECT_NE(heap->getBase(), MAP_FAILED);
+    ASSERT_EQ(log.lines("MemoryHeapBase").size(), 1U);
+    EXPECT_EQ(log.lines("MemoryHeapBase")[0].text, "F_ADD_SEALS failed: Invalid argument");
+}
+
 // A memory file of the test's own.
 int make_file(size_t size) {
     const int fd = memfd_create("given", MFD_CLOEXEC | MFD_ALLOW_SEALING);

@@ -9,10 +9,12 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <memory>
 #include <string>
 #include <thread>
 #include <vector>
 
+#include "platform/linux/binder/DriverRegistry.h"
 #include "support/log_capture.h"
 #include "support/loopback_driver.h"
 #include "support/platform_fault.h"
@@ -63,6 +65,19 @@ TEST(ProcessWithoutDriver, HasAServiceManagerThatFindsNothing) {
     const sp<IBinder> proxy = IInterface::asBinder(manager);
     EXPECT_EQ(proxy->linkToDeath(new Recipient), NO_INIT);
     EXPECT_EQ(proxy->pingBinder(), NO_INIT);
+}
+
+TEST(DriverChoice, IsTheFirstDriverWhenNoneIsNamedAndOneCanBeReplaced) {
+    static int opened = 0;
+    registerDriver("socket", [](Driver::Process&) -> std::unique_ptr<Driver> {
+        ++opened;
+        return nullptr;
+    });
+    setenv("BINDER_DRIVER", "", 1);
+    const LogCapture log;
+    EXPECT_NE(ProcessState::self(), nullptr);
+    EXPECT_NE(ProcessState::self(), nullptr);
+    EXPECT_EQ(opened, 1);
 }
 
 TEST(Process, AsksItsDriverForTheContextObject) {

@@ -263,6 +263,21 @@ TEST(RemoteHeap, WhoseMappingFailedIsTriedAgain) {
     EXPECT_NE(client->getBase(), MAP_FAILED);
 }
 
+int refuse_control(int, int, ...) {
+    errno = EMFILE;
+    return -1;
+}
+
+TEST(RemoteHeap, WhoseDescriptorCannotBeDuplicatedIsNone) {
+    const sp<MemoryHeapBase> heap = new MemoryHeapBase(kPage);
+    const sp<IMemoryHeap> client = client_of(heap);
+    const LogCapture log;
+    const PlatformHook hook("libbinder.so", "fcntl", refuse_control);
+    EXPECT_EQ(client->getBase(), MAP_FAILED);
+    ASSERT_EQ(log.lines("IMemory").size(), 1U);
+    EXPECT_EQ(log.lines("IMemory")[0].text, "A heap of another process could not be mapped: -24");
+}
+
 TEST(RemoteHeap, OfADeadProcessThatWasNeverMappedIsNone) {
     const LogCapture log;
     const sp<MemoryHeapBase> heap = new MemoryHeapBase(kPage);

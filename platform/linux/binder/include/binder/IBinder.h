@@ -9,10 +9,13 @@
 
 #include <cstdint>
 
-// The kernel's header has the same macro; either may be included first.
+// The kernel's header has the same macro, to the blank; either may be included first.
+// clang-format off
 #ifndef B_PACK_CHARS
-#define B_PACK_CHARS(c1, c2, c3, c4) ((((c1) << 24)) | (((c2) << 16)) | (((c3) << 8)) | (c4))
+#define B_PACK_CHARS(c1, c2, c3, c4) \
+	((((c1)<<24)) | (((c2)<<16)) | (((c3)<<8)) | (c4))
 #endif
+// clang-format on
 
 namespace android {
 
