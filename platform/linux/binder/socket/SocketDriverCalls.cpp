@@ -25,6 +25,7 @@ uint64_t nextChain(uint64_t instance) {
 status_t SocketDriver::transact(int32_t handle, uint32_t code, const Parcel& data, Parcel* reply, uint32_t flags) {
     References::Route route;
     if (isForked()) return INVALID_OPERATION;
+    if (reply != nullptr) reply->freeData();
     if (!references_.route(handle, route)) return BAD_TYPE;
     const status_t status = call(route, Purpose::kCalls, code, data, reply, flags);
     doErrandsWithoutPool();

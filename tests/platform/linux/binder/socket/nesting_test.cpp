@@ -1,6 +1,8 @@
 // Calls that come back, directly or by way of others, and the threads that run them.
 #include <unistd.h>
 
+#include <cstdio>
+#include <cstdlib>
 #include <thread>
 
 #include "test_service.h"
@@ -67,19 +69,28 @@ TEST(SocketNesting, FindsAWayWhenEveryThreadIsBusy) {
     start_pool(1);
     // Every thread of this process's pool is held up by calls from outside.
     ASSERT_EQ(ask(first, TestService::kKeep, own), 0);
-    Gate gate;
-    std::vector<std::thread> busy;
-    for (int i = 0; i < 2; ++i) {
-        busy.emplace_back([&] { EXPECT_EQ(gate.call(own), OK); });
-    }
-    const Process caller = Process::start("calls_kept_object", {"b"});
-    const Process other_caller = Process::start("calls_kept_object", {"b"});
+    Process one = Process::start("holds_up_kept", {"b"}), other = Process::start("holds_up_kept", {"b"});
+    ASSERT_EQ(one.read_line() + other.read_line(), "heldheld");
     EXPECT_EQ(relay(TestService::kThreadId, {first, second, own}), gettid());
     std::vector<sp<IBinder>> objects;
     for (int i = 0; i < 5; ++i) objects.insert(objects.end(), {first, second, own});
     EXPECT_EQ(relay(TestService::kThreadId, objects), gettid());
+    one.write_line("");
+    other.write_line("");
+    EXPECT_EQ(one.wait() + other.wait(), 0);
+}
+
+TEST_ROLE(holds_up_kept) {
+    const sp<IBinder> service = find_service(arguments[0]);
+    Gate gate;
+    std::thread caller([&] {
+        if (gate.call_kept(service) != OK) abort();
+    });
+    puts(gate.wait_for(1) ? "held" : "not held");
+    getchar();
     gate.open();
-    for (std::thread& thread : busy) thread.join();
+    caller.join();
+    return 0;
 }
 
 // Chains that all need the same few threads, and come back to servers whose threads are all part of a chain.
@@ -106,15 +117,19 @@ TEST(SocketNesting, LeavesUnrelatedCallsToThePool) {
     ASSERT_EQ(ask(service, TestService::kKeep, own), 0);
     // Somebody else has the server call this process, which has no pool yet, while a thread of it waits.
     Process other = Process::start("asks_for_thread_of_kept");
-    std::this_thread::sleep_for(std::chrono::milliseconds(100));
+    ASSERT_EQ(other.read_line(), "asking");
     Gate gate;
-    std::thread waiting([&] { EXPECT_EQ(gate.call(service), OK); });
+    std::atomic<int> waiting_thread{0};
+    std::thread waiting([&] {
+        waiting_thread = gettid();
+        EXPECT_EQ(gate.call(service), OK);
+    });
     EXPECT_TRUE(gate.wait_for(1));
     std::this_thread::sleep_for(std::chrono::milliseconds(100));
     start_pool();
     const int thread = std::stoi(other.read_line());
-    EXPECT_EQ(count_threads_named(getpid(), "Binder_") > 0, true);
     EXPECT_NE(thread, gettid());
+    EXPECT_NE(thread, waiting_thread);
     gate.open();
     waiting.join();
     EXPECT_EQ(other.wait(), 0);
@@ -123,6 +138,7 @@ TEST(SocketNesting, LeavesUnrelatedCallsToThePool) {
 TEST_ROLE(asks_for_thread_of_kept) {
     Parcel data;
     data.writeInt32(TestService::kThreadId);
+    puts("asking");
     printf("%d\n", ask(find_service(), TestService::kCallKept, data));
     return 0;
 }

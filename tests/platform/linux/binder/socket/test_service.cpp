@@ -18,12 +18,6 @@ namespace tavo::test {
 
 using namespace android;
 
-class TestService::Watcher : public IBinder::DeathRecipient {
-public:
-    void binderDied(const wp<IBinder>&) override { ++deaths; }
-    std::atomic<int> deaths{0};
-};
-
 TestService::~TestService() { --count_; }
 
 status_t TestService::onTransact(uint32_t code, const Parcel& data, Parcel* reply, uint32_t flags) {
@@ -68,7 +62,8 @@ status_t TestService::onTransact(uint32_t code, const Parcel& data, Parcel* repl
         }
         case kAppended: {
             const std::lock_guard<std::mutex> lock(mutex_);
-            return reply->writeInt32Array(appended_.size(), appended_.data());
+            reply->writeInt32(static_cast<int32_t>(appended_.size()));
+            return reply->write(appended_.data(), appended_.size() * sizeof(int32_t));
         }
         case kPublish: {
             const String16 name = data.readString16();
@@ -105,10 +100,19 @@ status_t TestService::onObject(uint32_t code, const Parcel& data, Parcel* reply)
         case kCallKept: {
             const sp<IBinder> kept = kept_;
             mutex_.unlock();
-            const status_t status =
-                kept->transact(static_cast<uint32_t>(data.readInt32()), Parcel(), reply);
+            const auto inner = static_cast<uint32_t>(data.readInt32());
+            Parcel request;
+            request.appendFrom(&data, data.dataPosition(), data.dataAvail());
+            const status_t status = kept->transact(inner, request, reply);
             mutex_.lock();
             return status;
+        }
+        case kPingKept: {
+            const sp<IBinder> kept = kept_;
+            mutex_.unlock();
+            const status_t status = kept->pingBinder();
+            mutex_.lock();
+            return reply->writeInt32(status);
         }
         case kWatchKept: watcher_ = new Watcher; return reply->writeInt32(kept_->linkToDeath(watcher_));
         case kDeaths: return reply->writeInt32(watcher_->deaths);
@@ -141,9 +145,20 @@ Gate::~Gate() {
 
 status_t Gate::call(const sp<IBinder>& service, uint32_t flags) const {
     Parcel data, reply;
+    write_to(data);
+    return service->transact(TestService::kBlock, data, &reply, flags);
+}
+
+status_t Gate::call_kept(const sp<IBinder>& service) const {
+    Parcel data, reply;
+    data.writeInt32(TestService::kBlock);
+    write_to(data);
+    return service->transact(TestService::kCallKept, data, &reply);
+}
+
+void Gate::write_to(Parcel& data) const {
     data.writeFileDescriptor(entered_[1]);
     data.writeFileDescriptor(closed_[0]);
-    return service->transact(TestService::kBlock, data, &reply, flags);
 }
 
 bool Gate::wait_for(int count) const {

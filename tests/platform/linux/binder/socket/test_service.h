@@ -39,7 +39,8 @@ public:
         kTakeKept,        // -> what was kept, which is forgotten
         kIsKept,          // binder -> whether it is what is kept
         kIsThis,          // binder -> whether it is this very object
-        kCallKept,        // code -> its reply
+        kCallKept,        // code, its request -> its reply
+        kPingKept,        // -> the status of a ping of what is kept
         kWatchKept,       // wants to hear of its death
         kDeaths,          // -> how many deaths were heard of
         kOpenPipe,        // -> both ends
@@ -64,7 +65,11 @@ private:
     android::status_t relay(const android::Parcel& data, android::Parcel* reply, uint32_t flags);
     android::status_t onObject(uint32_t code, const android::Parcel& data, android::Parcel* reply);
 
-    class Watcher;
+    class Watcher : public android::IBinder::DeathRecipient {
+    public:
+        void binderDied(const android::wp<android::IBinder>&) override { ++deaths; }
+        std::atomic<int> deaths{0};
+    };
     static inline std::atomic<int> count_{0};
     const int counted_ = ++count_;
     std::mutex mutex_;
@@ -83,6 +88,8 @@ public:
 
     // Blocks until the gate is opened.
     android::status_t call(const android::sp<android::IBinder>& service, uint32_t flags = 0) const;
+    // The same, of the object that the service has kept.
+    android::status_t call_kept(const android::sp<android::IBinder>& service) const;
     // Waits until so many more calls are held up, for ten seconds at most.
     bool wait_for(int count) const;
     // Whether a call has got to the gate since.
@@ -90,6 +97,8 @@ public:
     void open();
 
 private:
+    void write_to(android::Parcel& data) const;
+
     int entered_[2];
     int closed_[2];
 };
