@@ -3,12 +3,12 @@
 #include <binder/MemoryHeapBase.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cstring>
 #include <new>
 
+#include "ipc/descriptors.h"
 #include "ipc/fake_binders.h"
 #include "ipc/log_lines.h"
 #include "support/process.h"
@@ -22,10 +22,13 @@ using android::sp;
 using android::status_t;
 using tavo::test::ExpectedLine;
 using tavo::test::FakeRemote;
+using tavo::test::file_of;
+using tavo::test::is_open;
 using tavo::test::kBinderTag;
 using tavo::test::library_lines;
 using tavo::test::LogCapture;
 using tavo::test::logged_exactly;
+using tavo::test::NoInput;
 
 struct Operation {
     const char* name;
@@ -83,13 +86,6 @@ std::vector<uint8_t> request_bytes(int32_t policy, std::initializer_list<int32_t
 }
 
 constexpr int32_t kNoPolicy = 0x400000;  // the platform's own bit alone
-
-ino_t file_of(int descriptor) {
-    struct stat status = {};
-    return fstat(descriptor, &status) == 0 ? status.st_ino : 0;
-}
-
-bool is_open(int descriptor) { return fcntl(descriptor, F_GETFD) >= 0; }
 
 // --- every operation
 
@@ -195,14 +191,11 @@ TEST_P(BinderProxyDescriptor, IsNotInheritedByOtherPrograms) {
 }
 
 TEST_P(BinderProxyDescriptor, IsNeverDescriptorZero) {
-    answer_with(ends_[0]);
-    const int input = fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, 3);
-    close(STDIN_FILENO);
+    remote_->answer = [this](Parcel* reply) { return reply->writeFileDescriptor(ends_[0]); };
+    const NoInput input;
     const int descriptor = call(7);
     EXPECT_GT(descriptor, 0);
     EXPECT_FALSE(is_open(0));
-    dup2(input, STDIN_FILENO);
-    close(input);
     close(descriptor);
 }
 
