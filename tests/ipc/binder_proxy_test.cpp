@@ -37,6 +37,8 @@ struct Operation {
     int (*call)(ITavoBinder& proxy, int key);
 };
 
+void PrintTo(const Operation& operation, std::ostream* out) { *out << operation.name; }
+
 const Operation kIntOperations[] = {
     {"delete_shared_mem", 4, 0, [](ITavoBinder& proxy, int key) { return proxy.delete_shared_mem(key); }},
     {"create_message_queue", 5, 0, [](ITavoBinder& proxy, int key) { return proxy.create_message_queue(key); }},
