@@ -75,15 +75,15 @@ protected:
 
 // The policy word, the descriptor's length, its UTF-16 units with the terminator, and the arguments.
 std::vector<uint8_t> request_bytes(int32_t policy, std::initializer_list<int32_t> arguments) {
-    std::vector<uint8_t> bytes(4);
-    memcpy(bytes.data(), &policy, 4);
-    const uint8_t token[] = {7, 0, 0, 0, 't', 0, 'a', 0, 'v', 0, 'o', 0, '.', 0, 'm', 0, 'q', 0, 0, 0};
-    bytes.insert(bytes.end(), std::begin(token), std::end(token));
-    for (const int32_t argument : arguments) {
-        uint8_t word[4];
-        memcpy(word, &argument, 4);
-        bytes.insert(bytes.end(), word, word + 4);
-    }
+    std::vector<uint8_t> bytes;
+    const auto append = [&bytes](const void* data, size_t size) {
+        const auto* begin = static_cast<const uint8_t*>(data);
+        for (size_t i = 0; i < size; ++i) bytes.push_back(begin[i]);
+    };
+    const uint8_t descriptor[] = {7, 0, 0, 0, 't', 0, 'a', 0, 'v', 0, 'o', 0, '.', 0, 'm', 0, 'q', 0, 0, 0};
+    append(&policy, sizeof policy);
+    append(descriptor, sizeof descriptor);
+    for (const int32_t argument : arguments) append(&argument, sizeof argument);
     return bytes;
 }
 
