@@ -10,6 +10,9 @@
  * A handle is the address of a process-local object, always positive on success. It is valid until
  * tavo_msg_queue_destroy(); a handle that is not valid is not recognised, and using it is undefined.
  *
+ * Every handle holds both ends of the pipe. So a put never meets a pipe without a reader, raises no SIGPIPE,
+ * and waits for room in a full queue even when no receiver is left.
+ *
  * No locks are taken. Several threads and processes may put messages of up to 4092 bytes at once; longer ones
  * need a single writer. One thread at a time gets. Calls to the service block until it answers.
  */
