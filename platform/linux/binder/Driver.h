@@ -44,8 +44,8 @@ public:
         // lasts and calls target's transact. For a oneway transaction reply is a parcel nobody will see.
         virtual status_t execute(const sp<BBinder>& target, const Caller& caller, uint32_t code, const Parcel& data,
                                  Parcel* reply, uint32_t flags) = 0;
-        // Starts one more thread that calls joinThreadPool(false).
-        virtual void spawnPooledThread() = 0;
+        // Starts one more thread that calls joinThreadPool(false). False when there is none to be had.
+        virtual bool spawnPooledThread() = 0;
 
     protected:
         ~Process() = default;

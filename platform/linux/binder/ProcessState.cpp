@@ -35,7 +35,7 @@ public:
         const IPCThreadState::Serving serving({true, caller.pid, caller.uid}, flags);
         return target->transact(code, data, reply, flags);
     }
-    void spawnPooledThread() override { mProcess.spawnPooledThread(false); }
+    bool spawnPooledThread() override { return mProcess.startPooledThread(false); }
 
 private:
     ProcessState& mProcess;
@@ -70,8 +70,10 @@ void ProcessState::startThreadPool() {
     if (!mThreadPoolStarted.exchange(true)) spawnPooledThread(true);
 }
 
-void ProcessState::spawnPooledThread(bool isMain) {
-    if (!mThreadPoolStarted.load() || mDriver == nullptr) return;
+void ProcessState::spawnPooledThread(bool isMain) { startPooledThread(isMain); }
+
+bool ProcessState::startPooledThread(bool isMain) {
+    if (!mThreadPoolStarted.load() || mDriver == nullptr) return false;
     pthread_attr_t attributes;
     pthread_attr_init(&attributes);
     pthread_attr_setdetachstate(&attributes, PTHREAD_CREATE_DETACHED);
@@ -81,6 +83,7 @@ void ProcessState::spawnPooledThread(bool isMain) {
     if (error != 0) {
         __android_log_print(ANDROID_LOG_ERROR, kTag, "A thread of the pool could not be started: %s", strerror(error));
     }
+    return error == 0;
 }
 
 status_t ProcessState::setThreadPoolMaxThreadCount(size_t maxThreads) {

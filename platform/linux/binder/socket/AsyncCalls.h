@@ -11,14 +11,15 @@
 #include <unordered_map>
 
 #include "../Driver.h"
+#include "Link.h"
 
 namespace android::socket_driver {
 
 struct AsyncCall {
+    std::shared_ptr<Link> link;
     sp<BBinder> target;
     Driver::Caller caller;
-    uint32_t code;
-    uint32_t flags;
+    FrameHeader header;
     std::unique_ptr<Parcel> data;
 };
 
@@ -28,25 +29,17 @@ class AsyncCalls {
 public:
     enum class Admission { kRefused, kQueued, kQueuedFirst };
 
-    // Refused when the object has more waiting than half a parcel's limit. Whoever queued the first one must run()
-    // them.
-    Admission admit(AsyncCall call);
+    // Refused, and nothing taken, when the caller's process has too many waiting. Whoever queued the first one must have
+    // them run.
+    Admission admit(AsyncCall& call);
     // Runs the object's calls until none is left.
     void run(const BBinder* target, const std::function<void(AsyncCall&)>& execute);
 
 private:
-    static constexpr size_t kWaitingLimit = Driver::kParcelLimit / 2;
-    // Even an empty call takes memory.
-    static constexpr size_t kCallOverhead = 256;
-
-    struct Queue {
-        std::deque<AsyncCall> calls;
-        size_t waiting = 0;
-    };
-    static size_t costOf(const AsyncCall& call) { return call.data->dataSize() + kCallOverhead; }
+    static size_t costOf(const AsyncCall& call);
 
     std::mutex mutex_;
-    std::unordered_map<const BBinder*, Queue> queues_;
+    std::unordered_map<const BBinder*, std::deque<AsyncCall>> queues_;
 };
 
 }  // namespace android::socket_driver

@@ -1,8 +1,9 @@
 // Services by name: what this process publishes, and how it finds what others do.
 #pragma once
 
-#include <binder/IServiceManager.h>
+#include <binder/IBinder.h>
 
+#include <atomic>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -18,10 +19,15 @@ namespace android::socket_driver {
 // What the directory needs of the driver around it.
 class Neighbourhood {
 public:
-    virtual std::shared_ptr<Link> addLink(UniqueFd control, Driver::Caller peer, uint64_t instance) = 0;
-    virtual status_t call(const std::shared_ptr<Link>& link, uint64_t node, uint32_t code, const Parcel& data,
-                          Parcel* reply, uint32_t flags) = 0;
-    virtual Poller& poller() = 0;
+    // The link at the other end of a control connection: with the peer's Welcome where this process connected, without
+    // where the peer did. Null when it cannot be used.
+    virtual std::shared_ptr<Link> addLink(UniqueFd control, const Greeting* welcome) = 0;
+    virtual Greeting greeting(ControlType type) const = 0;
+    virtual status_t askDirectory(const std::shared_ptr<Link>& link, DirectoryCode code, const Parcel& data,
+                                  Parcel& reply) = 0;
+    // The listener is told when somebody connects.
+    virtual bool addListener(const std::shared_ptr<Endpoint>& listener) = 0;
+    virtual void removeListener(uint64_t listener) = 0;
 
 protected:
     ~Neighbourhood() = default;
@@ -37,6 +43,7 @@ public:
     status_t publish(const std::string& name, const sp<IBinder>& service);
     // What this process itself published; null for anything else.
     sp<IBinder> published(const std::string& name);
+    bool hasPublished() const { return hasPublished_; }
     // Whoever holds the name now, this process or another; null when nobody does.
     sp<IBinder> lookUp(const std::string& name);
     std::vector<std::string> list() const { return runtime_.list(); }
@@ -44,7 +51,6 @@ public:
     void forget(const std::shared_ptr<Link>& link);
 
 private:
-    class Listener;
     struct Publication {
         sp<IBinder> service;
         uint64_t listener;
@@ -52,28 +58,16 @@ private:
     };
 
     void welcome(UniqueFd connection);
-    std::shared_ptr<Link> linkTo(const std::string& name);
+    sp<IBinder> lookUpHere(const std::string& name);
+    sp<IBinder> ask(const std::string& name, UniqueFd connection);
+    std::shared_ptr<Link> linkThrough(UniqueFd connection);
 
     Neighbourhood& neighbourhood_;
     const RuntimeDirectory runtime_;
-    uint64_t instance_ = 0;
+    std::atomic<bool> hasPublished_{false};
     std::mutex mutex_;
     std::map<std::string, Publication> publications_;
     std::vector<std::shared_ptr<Link>> links_;  // that this process made by connecting
-};
-
-// The service manager of a process that has no daemon to ask.
-class SocketServiceManager : public BnServiceManager {
-public:
-    explicit SocketServiceManager(Directory& directory) : directory_(directory) {}
-
-    sp<IBinder> getService(const String16& name) const override;
-    sp<IBinder> checkService(const String16& name) const override;
-    status_t addService(const String16& name, const sp<IBinder>& service, bool allowIsolated) override;
-    Vector<String16> listServices() override;
-
-private:
-    Directory& directory_;
 };
 
 }  // namespace android::socket_driver

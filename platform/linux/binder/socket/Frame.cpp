@@ -1,9 +1,12 @@
 #include "Frame.h"
 
-#include <binder/IBinder.h>
+#include <fcntl.h>
+#include <linux/android/binder.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <utility>
 
 #include "../Driver.h"
 
@@ -12,34 +15,42 @@ namespace {
 
 constexpr uint8_t kPadding[8] = {};
 
+// Of what follows a header, this much comes with the same system call: a frame that is not larger comes whole.
+constexpr size_t kScratchSize = 4096;
+
+// What a larger frame's descriptors travel with. One packet of the kernel's always holds it.
+constexpr size_t kTailSize = 8;
+
+// The parts of a frame between two of its bytes.
 struct Segments {
     iovec parts[4];
     size_t count = 0;
+    size_t skip;
+    size_t left;
 
-    void add(const void* start, size_t size, size_t& skip) {
-        if (skip >= size) {
-            skip -= size;
-            return;
-        }
-        parts[count].iov_base = static_cast<uint8_t*>(const_cast<void*>(start)) + skip;
-        parts[count].iov_len = size - skip;
-        skip = 0;
-        ++count;
+    Segments(const OutgoingFrame& frame, size_t from, size_t to) : skip(from), left(to - from) {
+        const size_t dataSize = frame.header.dataSize;
+        add(&frame.header, sizeof frame.header);
+        add(frame.data, dataSize);
+        add(kPadding, padded(dataSize) - dataSize);
+        add(frame.offsets, frame.header.objectCount * sizeof(uint64_t));
+    }
+
+    void add(const void* start, size_t size) {
+        const size_t skipped = std::min(skip, size);
+        const size_t taken = std::min(size - skipped, left);
+        skip -= skipped;
+        left -= taken;
+        if (taken == 0) return;
+        parts[count++] = {static_cast<uint8_t*>(const_cast<void*>(start)) + skipped, taken};
     }
 };
 
-Segments segmentsOf(const OutgoingFrame& frame, size_t skip) {
-    Segments segments;
-    const size_t dataSize = frame.header.dataSize;
-    segments.add(&frame.header, sizeof frame.header, skip);
-    segments.add(frame.data, dataSize, skip);
-    segments.add(kPadding, padded(dataSize) - dataSize, skip);
-    segments.add(frame.offsets, frame.header.objectCount * sizeof(uint64_t), skip);
-    return segments;
-}
-
-ssize_t sendMessage(int fd, msghdr& message, const std::vector<int>& descriptors, int flags) {
+ssize_t sendMessage(int fd, iovec* parts, size_t count, const std::vector<int>& descriptors, int flags) {
     alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int) * kMaxDescriptors)];
+    msghdr message{};
+    message.msg_iov = parts;
+    message.msg_iovlen = count;
     if (!descriptors.empty()) {
         const size_t size = sizeof(int) * descriptors.size();
         message.msg_control = control;
@@ -56,6 +67,9 @@ ssize_t sendMessage(int fd, msghdr& message, const std::vector<int>& descriptors
     } while (sent < 0 && errno == EINTR);
     return sent;
 }
+
+// Errors that have nothing to do with what is sent.
+bool isOfTheConnection(int error) { return error == EAGAIN || error == EPIPE || error == ECONNRESET; }
 
 }  // namespace
 
@@ -79,6 +93,7 @@ ssize_t receive(int fd, iovec* buffers, size_t bufferCount, int flags, std::vect
         if (part->cmsg_level != SOL_SOCKET) continue;
         if (part->cmsg_type == SCM_RIGHTS) {
             const size_t received = (part->cmsg_len - CMSG_LEN(0)) / sizeof(int);
+            descriptors.reserve(descriptors.size() + received);
             for (size_t i = 0; i < received; ++i) {
                 int descriptor = -1;
                 memcpy(&descriptor, CMSG_DATA(part) + i * sizeof(int), sizeof(int));
@@ -93,14 +108,10 @@ ssize_t receive(int fd, iovec* buffers, size_t bufferCount, int flags, std::vect
 
 ssize_t sendBytes(int fd, const void* bytes, size_t size, const std::vector<int>& descriptors, int flags) {
     iovec part{const_cast<void*>(bytes), size};
-    msghdr message{};
-    message.msg_iov = &part;
-    message.msg_iovlen = 1;
-    return sendMessage(fd, message, descriptors, flags);
+    return sendMessage(fd, &part, 1, descriptors, flags);
 }
 
 FrameReader::Result FrameReader::read(int fd, int flags, Frame& frame) {
-    // A small frame comes whole with one call: its payload lands behind the header, in the scratch buffer.
     uint8_t scratch[kScratchSize];
     for (;;) {
         iovec buffers[2];
@@ -118,28 +129,50 @@ FrameReader::Result FrameReader::read(int fd, int flags, Frame& frame) {
             receive(fd, buffers, bufferCount, flags, current_.descriptors, current_.descriptorsLost);
         if (received < 0) return errno == EAGAIN || errno == EWOULDBLOCK ? Result::kAgain : Result::kClosed;
         if (received == 0) return Result::kClosed;
-        if (current_.descriptors.size() > kMaxDescriptors) return Result::kViolation;
 
         auto count = static_cast<size_t>(received);
+        bool receipt = false;
         if (inHeader) {
-            const size_t taken = count < buffers[0].iov_len ? count : buffers[0].iov_len;
+            const size_t taken = std::min(count, buffers[0].iov_len);
+            const uint8_t* behind = scratch;
             headerReceived_ += taken;
-            if (headerReceived_ < sizeof(FrameHeader)) continue;
-            const Result result = takeHeader(scratch, count - taken);
-            if (result != Result::kFrame) return result;
+            count -= taken;
+            receipt = skipReceipts(behind, count);
+            if (headerReceived_ == sizeof(FrameHeader)) {
+                const Result result = takeHeader(behind, count);
+                if (result != Result::kFrame) return result;
+            }
         } else {
             payloadReceived_ += count;
         }
-        if (payloadReceived_ == payloadSize_) return finish(frame);
+        if (headerReceived_ == sizeof(FrameHeader) && payloadReceived_ == payloadSize_) return finish(frame);
+        if (!current_.descriptors.empty() || current_.descriptorsLost) return Result::kViolation;
+        if (receipt) return Result::kReceipt;
     }
+}
+
+// Drops receipts, behind which the next frame may have come already.
+bool FrameReader::skipReceipts(const uint8_t*& behind, size_t& count) {
+    bool skipped = false;
+    const FrameHeader& header = current_.header;
+    while (headerReceived_ == sizeof header && header.magic == kMagic && header.type == FrameType::kReceipt &&
+           (header.dataSize | header.objectCount | header.descriptorCount) == 0) {
+        skipped = true;
+        headerReceived_ = std::min(count, sizeof header);
+        memcpy(&current_.header, behind, headerReceived_);
+        behind += headerReceived_;
+        count -= headerReceived_;
+    }
+    return skipped;
 }
 
 FrameReader::Result FrameReader::takeHeader(const uint8_t* behind, size_t count) {
     const FrameHeader& header = current_.header;
     const bool known = header.type == FrameType::kTransaction || header.type == FrameType::kReply;
     if (header.magic != kMagic || !known || header.reserved != 0) return Result::kViolation;
+    // Objects lie apart from each other, which also limits what the offsets take.
     if (header.dataSize > Driver::kParcelLimit || header.descriptorCount > kMaxDescriptors ||
-        header.objectCount > Driver::kParcelLimit / sizeof(uint64_t)) {
+        header.objectCount > header.dataSize / sizeof(flat_binder_object)) {
         return Result::kViolation;
     }
     payloadSize_ = padded(header.dataSize) + header.objectCount * sizeof(uint64_t);
@@ -155,37 +188,64 @@ FrameReader::Result FrameReader::takeHeader(const uint8_t* behind, size_t count)
 
 FrameReader::Result FrameReader::finish(Frame& frame) {
     const size_t expected = current_.header.descriptorCount;
-    const size_t arrived = current_.descriptors.size();
-    if (arrived != expected && !(current_.descriptorsLost && arrived < expected)) return Result::kViolation;
-    frame = std::move(current_);
-    current_ = Frame{};
+    if (current_.descriptors.size() > expected) return Result::kViolation;
+    if (current_.descriptors.size() < expected) current_.descriptorsLost = true;
+    frame = std::exchange(current_, Frame{});
     headerReceived_ = payloadReceived_ = payloadSize_ = 0;
     return Result::kFrame;
 }
 
-std::vector<uint8_t> OutgoingFrame::rest(size_t sent) const {
-    std::vector<uint8_t> bytes;
-    bytes.reserve(size() - sent);
-    const Segments segments = segmentsOf(*this, sent);
-    for (size_t i = 0; i < segments.count; ++i) {
-        const auto* start = static_cast<const uint8_t*>(segments.parts[i].iov_base);
-        bytes.insert(bytes.end(), start, start + segments.parts[i].iov_len);
-    }
-    return bytes;
-}
+size_t OutgoingFrame::descriptorsAt() const { return size() <= kScratchSize ? 0 : size() - kTailSize; }
 
 int sendFrame(int fd, const OutgoingFrame& frame, size_t& sent, int flags) {
+    static const std::vector<int>& kNone = *new std::vector<int>;
     const size_t size = frame.size();
+    const size_t descriptorsAt = frame.descriptors.empty() ? 0 : frame.descriptorsAt();
+    bool withDescriptors = !frame.descriptors.empty();
     while (sent < size) {
-        Segments segments = segmentsOf(frame, sent);
-        msghdr message{};
-        message.msg_iov = segments.parts;
-        message.msg_iovlen = segments.count;
-        const ssize_t count = sendMessage(fd, message, sent == 0 ? frame.descriptors : std::vector<int>(), flags);
-        if (count < 0) return errno;
-        sent += static_cast<size_t>(count);
+        const bool here = withDescriptors && sent == descriptorsAt;
+        Segments segments(frame, sent, sent < descriptorsAt ? descriptorsAt : size);
+        const ssize_t count =
+            sendMessage(fd, segments.parts, segments.count, here ? frame.descriptors : kNone, flags);
+        if (count >= 0) {
+            sent += static_cast<size_t>(count);
+        } else if (here && sent > 0 && !isOfTheConnection(errno)) {
+            withDescriptors = false;
+        } else {
+            return errno;
+        }
     }
     return 0;
+}
+
+std::unique_ptr<UnsentFrame> UnsentFrame::copy(const OutgoingFrame& frame, size_t sent) {
+    auto unsent = std::make_unique<UnsentFrame>();
+    OutgoingFrame& own = unsent->frame_;
+    own.header = frame.header;
+    unsent->sent_ = sent;
+    const size_t dataSize = frame.header.dataSize;
+    const size_t offsetsSize = frame.header.objectCount * sizeof(uint64_t);
+    if (dataSize != 0) {
+        unsent->payload_.reset(static_cast<uint8_t*>(malloc(padded(dataSize) + offsetsSize)));
+        uint8_t* payload = unsent->payload_.get();
+        if (payload == nullptr) return nullptr;
+        memcpy(payload, frame.data, dataSize);
+        if (offsetsSize != 0) memcpy(payload + padded(dataSize), frame.offsets, offsetsSize);
+        own.data = payload;
+        own.offsets = reinterpret_cast<const uint64_t*>(payload + padded(dataSize));
+    }
+    if (sent > frame.descriptorsAt()) return unsent;  // the descriptors are on their way
+    for (const int descriptor : frame.descriptors) {
+        UniqueFd duplicate(fcntl(descriptor, F_DUPFD_CLOEXEC, 0));
+        if (!duplicate.valid() && sent == 0) return nullptr;
+        if (!duplicate.valid()) {
+            own.descriptors.clear();
+            break;
+        }
+        own.descriptors.push_back(duplicate.get());
+        unsent->descriptors_.push_back(std::move(duplicate));
+    }
+    return unsent;
 }
 
 }  // namespace android::socket_driver

@@ -34,17 +34,15 @@ struct Frame {
     std::vector<UniqueFd> descriptors;
     bool descriptorsLost = false;
 
-    const uint8_t* data() const { return payload.get(); }
-    const uint64_t* offsets() const {
-        return reinterpret_cast<const uint64_t*>(payload.get() + padded(header.dataSize));
-    }
+    uint64_t* offsets() const { return reinterpret_cast<uint64_t*>(payload.get() + padded(header.dataSize)); }
 };
 
 // Takes a stream apart into frames, however the bytes arrive.
 class FrameReader {
 public:
     enum class Result {
-        kFrame,      // one whole frame
+        kFrame,      // one whole transaction or reply
+        kReceipt,    // a receipt, and no whole frame behind it
         kAgain,      // no more bytes for now
         kClosed,     // the peer is gone
         kViolation,  // the bytes are not a frame, or not one that may be received
@@ -56,8 +54,7 @@ public:
     Result read(int fd, int flags, Frame& frame);
 
 private:
-    static constexpr size_t kScratchSize = 4096;
-
+    bool skipReceipts(const uint8_t*& behind, size_t& count);
     Result takeHeader(const uint8_t* behind, size_t count);
     Result finish(Frame& frame);
 
@@ -75,12 +72,30 @@ struct OutgoingFrame {
     std::vector<int> descriptors;
 
     size_t size() const { return sizeof header + padded(header.dataSize) + header.objectCount * sizeof(uint64_t); }
-    // The bytes from `sent` on, as a copy.
-    std::vector<uint8_t> rest(size_t sent) const;
+    // The byte with which the descriptors go.
+    size_t descriptorsAt() const;
 };
 
 // Sends the frame from byte `sent` on and advances `sent`. Returns 0 when all is sent, else errno: EAGAIN only with
-// MSG_DONTWAIT in flags.
+// MSG_DONTWAIT in flags. Descriptors that turn out not to be passed on when part of the frame is sent
+// already are left out, which the receiver takes as lost.
 int sendFrame(int fd, const OutgoingFrame& frame, size_t& sent, int flags);
+
+// What a peer has not taken yet of a frame.
+class UnsentFrame {
+public:
+    // Null when there is no memory for a copy, or no descriptor. Of a frame that is on its way already, it rather leaves
+    // out the descriptors.
+    static std::unique_ptr<UnsentFrame> copy(const OutgoingFrame& frame, size_t sent);
+
+    // 0 when nothing is left, else errno.
+    int send(int fd) { return sendFrame(fd, frame_, sent_, MSG_DONTWAIT); }
+
+private:
+    OutgoingFrame frame_;
+    size_t sent_ = 0;
+    Bytes payload_;
+    std::vector<UniqueFd> descriptors_;
+};
 
 }  // namespace android::socket_driver

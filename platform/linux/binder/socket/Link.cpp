@@ -1,10 +1,13 @@
 #include "Link.h"
 
+#include <linux/android/binder.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/uio.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cstring>
 
 #include "Frame.h"
@@ -12,65 +15,128 @@
 namespace android::socket_driver {
 namespace {
 
+// Channels kept for later calls.
+constexpr size_t kMaxIdle = 16;
+// One is enough for the directory, which answers at once.
+constexpr size_t kMaxDirectoryChannels = 1;
+// A peer that closes a channel and opens the next may be seen doing so the other way round.
+constexpr size_t kServedSlack = 2;
+constexpr size_t kMaxIntroductions = kMaxDescriptors;
+// A peer that does not listen while more than this is to be told is cut off. One parcel's objects are far fewer.
+constexpr size_t kMaxReleases = 4 * Driver::kParcelLimit / sizeof(flat_binder_object);
+// What oneway calls of one peer may take while they wait.
+constexpr size_t kWaitingLimit = Driver::kParcelLimit / 2;
+
+constexpr std::chrono::seconds kVerdictLimit{1};
+
 struct ReleasePacket {
     ControlHeader header{kMagic, ControlType::kRelease};
     ReleasedReference references[kReleaseBatch];
 };
 
-}  // namespace
-
-void Link::onReady() {
-    if (!baton_.take()) return;
-    do {
-        flushReleases();
-        for (bool again = true; again;) {
-            if (!readMessage(again)) {
-                events_.linkEnded(shared_from_this());
-                return;  // with the baton: nobody needs to look here again
-            }
-        }
-    } while (!baton_.giveBack());
+// The message in a packet, which is exactly as long; what it holds must be checked.
+template <typename Message>
+bool parse(const uint8_t* packet, size_t size, Message& message) {
+    if (size != sizeof message) return false;
+    memcpy(&message, packet, sizeof message);
+    return true;
 }
 
-bool Link::readMessage(bool& again) {
+}  // namespace
+
+Link::Link(LinkEvents& events, Poller& poller, UniqueFd control, Driver::Caller peer)
+    : events_(events), poller_(poller), control_(std::move(control)), peer_(peer), identity_{id, -1} {}
+
+void Link::greet(const Greeting& greeting) {
+    instance_ = greeting.instance;
+    // A process of another pid namespace has no pid here, so nothing vouches for what it says.
+    if (peer_.pid > 0) identity_ = {greeting.instance, peer_.pid};
+    maxChannels_ = std::max(greeting.maxChannels, 1U);
+    greeted_ = true;
+}
+
+bool Link::addIntroduction(const std::shared_ptr<Link>& introduced) {
+    const auto isOver = [](const std::weak_ptr<Link>& link) {
+        const std::shared_ptr<Link> known = link.lock();
+        return known == nullptr || known->isGreeted();
+    };
+    introductions_.erase(std::remove_if(introductions_.begin(), introductions_.end(), isOver), introductions_.end());
+    if (introductions_.size() >= kMaxIntroductions) return false;
+    introductions_.push_back(introduced);
+    return true;
+}
+
+// -- Control messages
+
+void Link::onReady() {
+    {
+        const std::lock_guard<std::mutex> lock(mutex_);
+        if (isUnheard_) flushReleases();
+    }
+    if (!readMessage()) events_.linkEnded(std::static_pointer_cast<Link>(shared_from_this()));
+}
+
+// Reads one, so that no peer keeps the others waiting.
+bool Link::readMessage() {
     alignas(8) uint8_t packet[sizeof(ReleasePacket)];
     iovec buffer{packet, sizeof packet};
     std::vector<UniqueFd> descriptors;
     bool lost = false;
-    ucred sender{};
-    const ssize_t size = receive(control_.get(), &buffer, 1, MSG_DONTWAIT | MSG_TRUNC, descriptors, lost, &sender);
-    if (size < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) {
-        again = false;
-        return true;
-    }
-    // Only a link that was made for somebody else's use learns here who uses it.
-    if (size > 0 && sender.pid != 0) peer_ = packed({sender.pid, sender.uid});
-    return size > 0 && static_cast<size_t>(size) <= sizeof packet &&
-           handleMessage(packet, static_cast<size_t>(size), descriptors);
+    ucred sender{-1, 0, 0};
+    const ssize_t received = receive(control_.get(), &buffer, 1, MSG_DONTWAIT | MSG_TRUNC, descriptors, lost, &sender);
+    if (received < 0) return errno == EAGAIN || errno == EWOULDBLOCK;
+    const auto size = static_cast<size_t>(received);
+    if (size < sizeof(ControlHeader) || size > sizeof packet) return false;
+    // Only a link that was made for somebody else learns here who that is, and nobody may take his place.
+    if (sender.pid >= 0 && !greeted_) peer_ = {sender.pid, sender.uid};
+    if (sender.pid >= 0 && (sender.pid != peer_.pid || sender.uid != peer_.uid)) return false;
+    return handleMessage(packet, size, descriptors, lost);
 }
 
-bool Link::handleMessage(const uint8_t* packet, size_t size, std::vector<UniqueFd>& descriptors) {
+bool Link::handleMessage(const uint8_t* packet, size_t size, std::vector<UniqueFd>& descriptors, bool lost) {
     ControlHeader header;
-    if (size < sizeof header) return false;
     memcpy(&header, packet, sizeof header);
-    if (header.magic != kMagic) return false;
-
-    const size_t rest = size - sizeof header;
+    if (header.magic != kMagic || greeted_ != (header.type != ControlType::kHello)) return false;
     if (header.type == ControlType::kChannel) {
-        if (rest != 0 || descriptors.size() != 1) return false;
-        events_.channelOffered(shared_from_this(), std::move(descriptors.front()));
-        return true;
+        ChannelOffer offer;
+        return parse(packet, size, offer) && handleOffer(offer, descriptors, lost);
     }
-    if (header.type == ControlType::kRelease) {
-        if (!descriptors.empty() || rest % sizeof(ReleasedReference) != 0) return false;
-        for (size_t at = sizeof header; at < size; at += sizeof(ReleasedReference)) {
-            ReleasedReference released;
-            memcpy(&released, packet + at, sizeof released);
-            events_.referencesReleased(*this, released.node, released.count);
+    if (!descriptors.empty() || lost) return false;
+
+    switch (header.type) {
+        case ControlType::kHello: {
+            Greeting hello;
+            if (!parse(packet, size, hello)) return false;
+            greet(hello);
+            return true;
         }
-        return true;
+        case ControlType::kRefusal: {
+            const std::lock_guard<std::mutex> lock(mutex_);
+            ++refusals_;
+            changed_.notify_all();
+            return size == sizeof header;
+        }
+        case ControlType::kRelease: {
+            if ((size - sizeof header) % sizeof(ReleasedReference) != 0) return false;
+            for (size_t at = sizeof header; at < size; at += sizeof(ReleasedReference)) {
+                ReleasedReference released;
+                memcpy(&released, packet + at, sizeof released);
+                events_.referencesReleased(*this, released.node, released.count);
+            }
+            return true;
+        }
+        default: return false;
     }
-    return false;
+}
+
+bool Link::handleOffer(const ChannelOffer& offer, std::vector<UniqueFd>& descriptors, bool lost) {
+    const bool known = offer.purpose == Purpose::kCalls || offer.purpose == Purpose::kDirectory;
+    if (!known || offer.reserved != 0 || descriptors.size() != (lost ? 0 : 1)) return false;
+    const auto self = std::static_pointer_cast<Link>(shared_from_this());
+    if (!lost && events_.channelOffered(self, offer.purpose, std::move(descriptors.front()))) return true;
+    // Without the peer's hearing of it, its call would wait for ever.
+    const ControlHeader refusal{kMagic, ControlType::kRefusal};
+    return !dead_ && sendBytes(control_.get(), &refusal, sizeof refusal, {}, MSG_DONTWAIT) >= 0;
 }
 
 void Link::cut() {
@@ -78,92 +144,153 @@ void Link::cut() {
     dead_ = true;
     shutdown(control_.get(), SHUT_RDWR);
     for (const int channel : calling_) shutdown(channel, SHUT_RDWR);
-    idle_.clear();
+    for (Outgoing& channels : outgoing_) {
+        channels.open -= channels.idle.size();
+        channels.idle.clear();
+    }
     releases_.clear();
+    changed_.notify_all();
 }
 
-UniqueFd Link::takeChannel(status_t& error) {
+// -- Channels to call on
+
+status_t Link::takeChannel(Purpose purpose, Channel& channel) {
     {
-        const std::lock_guard<std::mutex> lock(mutex_);
-        if (dead_) {
-            error = DEAD_OBJECT;
-            return UniqueFd();
+        std::unique_lock<std::mutex> lock(mutex_);
+        Outgoing& channels = outgoing(purpose);
+        const size_t most = purpose == Purpose::kDirectory ? kMaxDirectoryChannels : maxChannels_;
+        changed_.wait(lock, [&] { return dead_ || !channels.idle.empty() || channels.open < most; });
+        if (dead_) return DEAD_OBJECT;
+        channel.purpose_ = purpose;
+        if (channels.idle.empty()) {
+            ++channels.open;
+            channel.isFresh_ = true;
+        } else {
+            channel.fd_ = std::move(channels.idle.back());
+            channels.idle.pop_back();
+            calling_.push_back(channel.fd());
         }
-        if (!idle_.empty()) {
-            UniqueFd channel = std::move(idle_.back());
-            idle_.pop_back();
-            calling_.push_back(channel.get());
-            return channel;
-        }
+        channel.link_ = this;
     }
+    return channel.isFresh() ? makeChannel(purpose, channel) : OK;
+}
+
+status_t Link::makeChannel(Purpose purpose, Channel& channel) {
     // The serving side knows its caller by the credentials of the process that made the pair: this one.
     int ends[2];
-    if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
-        error = -errno;
-        return UniqueFd();
-    }
-    UniqueFd channel(ends[0]);
+    if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return NO_MEMORY;
+    channel.fd_.reset(ends[0]);
     const UniqueFd offered(ends[1]);
-    const ControlHeader offer{kMagic, ControlType::kChannel};
-    if (sendBytes(control_.get(), &offer, sizeof offer, {offered.get()}, 0) < 0) {
-        error = errno == EPIPE || errno == ECONNRESET ? DEAD_OBJECT : -errno;
-        return UniqueFd();
+    {
+        const std::lock_guard<std::mutex> lock(mutex_);
+        if (dead_) return DEAD_OBJECT;
+        calling_.push_back(channel.fd());
     }
-    const std::lock_guard<std::mutex> lock(mutex_);
-    if (dead_) {
-        error = DEAD_OBJECT;
-        return UniqueFd();
-    }
-    calling_.push_back(channel.get());
-    return channel;
+    const ChannelOffer offer{{kMagic, ControlType::kChannel}, purpose, 0};
+    if (sendBytes(control_.get(), &offer, sizeof offer, {offered.get()}, 0) >= 0) return OK;
+    return errno == EPIPE || errno == ECONNRESET ? DEAD_OBJECT : NO_MEMORY;
 }
 
-void Link::returnChannel(UniqueFd channel, bool reusable) {
+void Link::returnChannel(Channel& channel) {
     const std::lock_guard<std::mutex> lock(mutex_);
-    calling_.erase(std::find(calling_.begin(), calling_.end(), channel.get()));
-    if (reusable && !dead_ && idle_.size() < kMaxIdleChannels) idle_.push_back(std::move(channel));
+    calling_.erase(std::remove(calling_.begin(), calling_.end(), channel.fd()), calling_.end());
+    Outgoing& channels = outgoing(channel.purpose_);
+    if (channel.inOrder_ && !dead_ && channels.idle.size() < kMaxIdle) {
+        channels.idle.push_back(std::move(channel.fd_));
+    } else {
+        --channels.open;
+    }
+    // Closed under the lock if at all: cut() must not meet another descriptor of the same number.
+    channel.fd_.reset();
+    changed_.notify_all();
 }
 
-bool Link::addServed(uint64_t channel) {
+status_t Link::heedRefusal() {
+    std::unique_lock<std::mutex> lock(mutex_);
+    // The word comes at once, unless nobody listens to it any more because this process exits.
+    changed_.wait_for(lock, kVerdictLimit, [&] { return dead_ || refusals_ > 0; });
+    if (refusals_ == 0) return DEAD_OBJECT;
+    --refusals_;
+    return NO_MEMORY;
+}
+
+bool Link::waitForIdle(Purpose purpose) {
+    std::unique_lock<std::mutex> lock(mutex_);
+    Outgoing& channels = outgoing(purpose);
+    changed_.wait(lock, [&] { return dead_ || !channels.idle.empty() || channels.open == 0; });
+    return !channels.idle.empty();
+}
+
+// -- Channels to serve
+
+uint32_t Link::maxServedChannels() {
+    static const uint32_t most = [] {
+        rlimit limit{};
+        const rlim_t descriptors = getrlimit(RLIMIT_NOFILE, &limit) == 0 ? limit.rlim_cur : 0;
+        return static_cast<uint32_t>(std::clamp<rlim_t>(descriptors / 16, 16, 256));
+    }();
+    return most;
+}
+
+bool Link::addServed(uint64_t channel, Purpose purpose) {
     const std::lock_guard<std::mutex> lock(mutex_);
-    if (dead_ || served_.size() >= kMaxServedChannels) return false;
-    served_.insert(channel);
+    size_t& count = servedCount_[static_cast<size_t>(purpose)];
+    const size_t most = purpose == Purpose::kDirectory ? kMaxDirectoryChannels : maxServedChannels();
+    if (dead_ || count >= kServedSlack * most) return false;
+    served_[channel] = purpose;
+    ++count;
     return true;
 }
 
 void Link::removeServed(uint64_t channel) {
     const std::lock_guard<std::mutex> lock(mutex_);
-    served_.erase(channel);
+    const auto found = served_.find(channel);
+    if (found == served_.end()) return;
+    --servedCount_[static_cast<size_t>(found->second)];
+    served_.erase(found);
 }
 
 std::vector<uint64_t> Link::takeServed() {
     const std::lock_guard<std::mutex> lock(mutex_);
-    std::vector<uint64_t> channels(served_.begin(), served_.end());
+    std::vector<uint64_t> channels;
+    for (const auto& [channel, purpose] : served_) channels.push_back(channel);
     served_.clear();
     return channels;
 }
 
+bool Link::addWaiting(size_t cost) {
+    // One that is alone always fits: it is no larger than a parcel.
+    const size_t before = waiting_.fetch_add(cost);
+    if (before == 0 || before + cost <= kWaitingLimit) return true;
+    waiting_ -= cost;
+    return false;
+}
+
+// -- References
+
 void Link::releaseReferences(uint64_t node, uint64_t count) {
-    {
-        const std::lock_guard<std::mutex> lock(mutex_);
-        if (dead_) return;
-        releases_[node] += count;
-    }
-    flushReleases();
+    const std::lock_guard<std::mutex> lock(mutex_);
+    if (dead_) return;
+    releases_.push_back({node, count});
+    if (!isUnheard_) flushReleases();
+    if (releases_.size() > kMaxReleases) shutdown(control_.get(), SHUT_RDWR);
 }
 
 void Link::flushReleases() {
-    const std::lock_guard<std::mutex> lock(mutex_);
-    while (!releases_.empty() && !dead_) {
+    while (!releases_.empty()) {
         ReleasePacket packet;
         size_t count = 0;
-        auto last = releases_.begin();
-        for (; last != releases_.end() && count < kReleaseBatch; ++last) {
-            packet.references[count++] = {last->first, last->second};
+        while (count < std::min(releases_.size(), kReleaseBatch)) {
+            packet.references[count] = releases_[count];
+            ++count;
         }
         const size_t size = sizeof packet.header + count * sizeof(ReleasedReference);
-        if (sendBytes(control_.get(), &packet, size, {}, MSG_DONTWAIT) < 0) return;
-        releases_.erase(releases_.begin(), last);
+        if (sendBytes(control_.get(), &packet, size, {}, MSG_DONTWAIT) < 0) break;
+        releases_.erase(releases_.begin(), releases_.begin() + static_cast<std::ptrdiff_t>(count));
+    }
+    if (isUnheard_ == releases_.empty()) {
+        isUnheard_ = !isUnheard_;
+        poller_.change(*this, Poller::kReadable | (isUnheard_ ? Poller::kWritable : 0U));
     }
 }
 

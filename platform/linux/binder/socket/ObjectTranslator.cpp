@@ -1,6 +1,9 @@
 #include "ObjectTranslator.h"
 
+#include <sys/socket.h>
+
 #include <cstring>
+#include <utility>
 
 namespace android::socket_driver {
 namespace {
@@ -31,7 +34,7 @@ bool areOffsetsValid(const uint64_t* offsets, size_t count, size_t dataSize) {
 status_t ObjectTranslator::pack(const Parcel& parcel, Link& link, OutgoingParcel& out) {
     const size_t size = parcel.ipcDataSize();
     const size_t count = parcel.ipcObjectsCount();
-    if (size > Driver::kParcelLimit || count * sizeof(uint64_t) > Driver::kParcelLimit) return FAILED_TRANSACTION;
+    if (size > Driver::kParcelLimit || count > size / sizeof(flat_binder_object)) return FAILED_TRANSACTION;
 
     OutgoingFrame& frame = out.frame;
     frame.header.magic = kMagic;
@@ -82,20 +85,9 @@ status_t ObjectTranslator::packObject(flat_binder_object& object, Link& link, Ou
             break;
         }
         case BINDER_TYPE_HANDLE: {
-            References::Route route;
-            if (!references_.route(static_cast<int32_t>(object.handle), route)) return FAILED_TRANSACTION;
-            if (route.link.get() == &link) {
-                wire = wireObject(WireObject::kReceiversNode, object.flags);
-            } else {
-                UniqueFd control;
-                const status_t status = introducer_.introduce(route, control);
-                if (status != OK) return status;
-                wire = wireObject(WireObject::kIntroduction, object.flags);
-                wire.cookie = out.frame.descriptors.size();
-                out.frame.descriptors.push_back(control.get());
-                out.introductions.push_back(std::move(control));
-            }
-            wire.binder = route.node;
+            wire.flags = object.flags;
+            const status_t status = packProxy(static_cast<int32_t>(object.handle), wire, link, out);
+            if (status != OK) return status;
             break;
         }
         case BINDER_TYPE_FD:
@@ -111,6 +103,26 @@ status_t ObjectTranslator::packObject(flat_binder_object& object, Link& link, Ou
     return OK;
 }
 
+status_t ObjectTranslator::packProxy(int32_t handle, flat_binder_object& wire, Link& link, OutgoingParcel& out) {
+    if (const uint64_t node = references_.acquireFrom(link, handle); node != 0) {
+        wire = wireObject(WireObject::kReceiversNode, wire.flags);
+        wire.binder = node;
+        // The owner must not hear of its being released before it has heard of this.
+        out.handles.take(references_, handle);
+        return OK;
+    }
+    References::Route route;
+    UniqueFd control;
+    if (!references_.route(handle, route)) return FAILED_TRANSACTION;
+    const status_t status = introducer_.introduce(route, control);
+    if (status != OK) return status;
+    wire = wireObject(WireObject::kIntroduction, wire.flags);
+    wire.cookie = out.frame.descriptors.size();
+    out.frame.descriptors.push_back(control.get());
+    out.introductions.push_back(std::move(control));
+    return OK;
+}
+
 void ObjectTranslator::takeBack(Link& link, OutgoingParcel& out) {
     for (const uint64_t node : out.given) references_.takeBack(link, node, 1);
     out.given.clear();
@@ -118,67 +130,65 @@ void ObjectTranslator::takeBack(Link& link, OutgoingParcel& out) {
 
 // What came in with a parcel and goes with it.
 struct ObjectTranslator::Received {
-    explicit Received(References& owner) : references(owner) {}
-    Received(const Received&) = delete;
-    Received& operator=(const Received&) = delete;
-    ~Received() {
-        for (const int32_t handle : handles) references.release(handle);
-    }
-
-    References& references;
-    std::vector<int32_t> handles;
+    UsedHandles handles;
     std::vector<sp<BBinder>> objects;
     std::vector<UniqueFd> descriptors;
 };
 
-status_t ObjectTranslator::unpack(Frame& frame, const std::shared_ptr<Link>& link, Parcel& parcel) {
+status_t ObjectTranslator::unpack(Frame& frame, const std::shared_ptr<Link>& link, Parcel& parcel, bool* speaksOfOwn) {
     const size_t size = frame.header.dataSize;
     const size_t count = frame.header.objectCount;
     if (!areOffsetsValid(frame.offsets(), count, size)) return BAD_VALUE;
-    if (frame.descriptorsLost) return FAILED_TRANSACTION;
 
     std::unique_ptr<Received> received;
-    if (count > 0) received = std::make_unique<Received>(references_);
+    if (count > 0) received = std::make_unique<Received>();
     for (size_t i = 0; i < count; ++i) {
         uint8_t* place = frame.payload.get() + frame.offsets()[i];
         flat_binder_object object;
         memcpy(&object, place, sizeof object);
-        const status_t status = unpackObject(object, frame, link, *received);
-        if (status != OK) return status;
+        // Without its descriptors the frame is of no use, but the references in it must be given back.
+        if (!unpackObject(object, frame, link, *received) && !frame.descriptorsLost) return BAD_VALUE;
         memcpy(place, &object, sizeof object);
     }
     for (const UniqueFd& descriptor : frame.descriptors) {
-        if (descriptor.valid()) return BAD_VALUE;  // no object speaks of it
+        if (descriptor.valid() && !frame.descriptorsLost) return BAD_VALUE;  // no object speaks of it
     }
+    if (speaksOfOwn != nullptr) *speaksOfOwn = received != nullptr && !received->objects.empty();
+    if (frame.descriptorsLost) return FAILED_TRANSACTION;
     if (size == 0) return OK;
     const auto* objects = reinterpret_cast<const binder_size_t*>(frame.offsets());
     parcel.ipcSetDataReference(frame.payload.release(), size, objects, count, releaseReceived, received.release());
     return OK;
 }
 
-status_t ObjectTranslator::unpackObject(flat_binder_object& object, Frame& frame, const std::shared_ptr<Link>& link,
-                                        Received& received) {
+bool ObjectTranslator::unpackObject(flat_binder_object& object, Frame& frame, const std::shared_ptr<Link>& link,
+                                    Received& received) {
     flat_binder_object local{};
     local.flags = object.flags;
-    local.hdr.type = BINDER_TYPE_BINDER;
+    const auto setOwn = [&](const sp<BBinder>& own) {
+        local.hdr.type = BINDER_TYPE_BINDER;
+        local.binder = reinterpret_cast<uintptr_t>(own->getWeakRefs());
+        local.cookie = reinterpret_cast<uintptr_t>(own.get());
+        received.objects.push_back(own);
+    };
+    const auto setHandle = [&](int32_t handle) {
+        local.hdr.type = BINDER_TYPE_HANDLE;
+        local.handle = static_cast<uint32_t>(handle);
+        received.handles.take(references_, handle);
+    };
+
     switch (static_cast<WireObject>(object.hdr.type)) {
-        case WireObject::kNull: break;
-        case WireObject::kSendersNode:
-            local.hdr.type = BINDER_TYPE_HANDLE;
-            received.handles.push_back(references_.adopt(link, object.binder));
-            local.handle = static_cast<uint32_t>(received.handles.back());
-            break;
+        case WireObject::kNull: local.hdr.type = BINDER_TYPE_BINDER; break;
+        case WireObject::kSendersNode: setHandle(references_.adopt(link, object.binder)); break;
         case WireObject::kReceiversNode: {
             const sp<BBinder> own = references_.find(*link, object.binder);
-            if (own == nullptr) return BAD_VALUE;
-            local.binder = reinterpret_cast<uintptr_t>(own->getWeakRefs());
-            local.cookie = reinterpret_cast<uintptr_t>(own.get());
-            received.objects.push_back(own);
+            if (own == nullptr) return false;
+            setOwn(own);
             break;
         }
         case WireObject::kDescriptor: {
             UniqueFd descriptor;
-            if (!takeDescriptor(object.handle, frame, descriptor)) return BAD_VALUE;
+            if (!takeDescriptor(object.handle, frame, descriptor)) return false;
             local.hdr.type = BINDER_TYPE_FD;
             local.handle = static_cast<uint32_t>(descriptor.get());
             local.cookie = 1;  // the parcel's to close
@@ -187,18 +197,21 @@ status_t ObjectTranslator::unpackObject(flat_binder_object& object, Frame& frame
         }
         case WireObject::kIntroduction: {
             UniqueFd control;
-            if (!takeDescriptor(object.cookie, frame, control)) return BAD_VALUE;
-            const std::shared_ptr<Link> introduced = introducer_.meet(std::move(control));
-            if (introduced == nullptr) return BAD_VALUE;
-            local.hdr.type = BINDER_TYPE_HANDLE;
-            received.handles.push_back(references_.adopt(introduced, object.binder));
-            local.handle = static_cast<uint32_t>(received.handles.back());
+            sp<BBinder> own;
+            int32_t handle = 0;
+            if (!takeDescriptor(object.cookie, frame, control)) return false;
+            if (!introducer_.meet(std::move(control), own, handle)) return false;
+            if (own != nullptr) {
+                setOwn(own);
+            } else {
+                setHandle(handle);
+            }
             break;
         }
-        default: return BAD_VALUE;
+        default: return false;
     }
     object = local;
-    return OK;
+    return true;
 }
 
 bool ObjectTranslator::takeDescriptor(uint64_t index, Frame& frame, UniqueFd& descriptor) {

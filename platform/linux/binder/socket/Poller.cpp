@@ -1,13 +1,8 @@
 #include "Poller.h"
 
-#include <sys/epoll.h>
-
 namespace android::socket_driver {
-namespace {
 
-uint32_t eventsFor(bool writable) { return EPOLLIN | EPOLLRDHUP | EPOLLET | (writable ? EPOLLOUT : 0U); }
-
-}  // namespace
+std::atomic<uint64_t> Endpoint::lastId_{0};
 
 bool Baton::take() {
     int state = kFree;
@@ -25,23 +20,24 @@ bool Baton::giveBack() {
 
 Poller::Poller() : epoll_(epoll_create1(EPOLL_CLOEXEC)) {}
 
-uint64_t Poller::reserveId() {
-    const std::lock_guard<std::mutex> lock(mutex_);
-    return ++lastId_;
-}
-
-bool Poller::add(const std::shared_ptr<Endpoint>& endpoint, bool writable) {
+bool Poller::add(const std::shared_ptr<Endpoint>& endpoint, uint32_t events) {
     {
         const std::lock_guard<std::mutex> lock(mutex_);
-        if (endpoint->id == 0) endpoint->id = ++lastId_;
         endpoints_[endpoint->id] = endpoint;
     }
     epoll_event event{};
-    event.events = eventsFor(writable);
+    event.events = events;
     event.data.u64 = endpoint->id;
     if (epoll_ctl(epoll_.get(), EPOLL_CTL_ADD, endpoint->fd(), &event) == 0) return true;
     remove(endpoint->id);
     return false;
+}
+
+void Poller::change(const Endpoint& endpoint, uint32_t events) {
+    epoll_event event{};
+    event.events = events;
+    event.data.u64 = endpoint.id;
+    epoll_ctl(epoll_.get(), EPOLL_CTL_MOD, endpoint.fd(), &event);
 }
 
 std::shared_ptr<Endpoint> Poller::remove(uint64_t id) {
@@ -54,19 +50,16 @@ std::shared_ptr<Endpoint> Poller::remove(uint64_t id) {
     return endpoint;
 }
 
-void Poller::wantWritable(const Endpoint& endpoint, bool wanted) {
-    epoll_event event{};
-    event.events = eventsFor(wanted);
-    event.data.u64 = endpoint.id;
-    epoll_ctl(epoll_.get(), EPOLL_CTL_MOD, endpoint.fd(), &event);
+std::shared_ptr<Endpoint> Poller::find(uint64_t id) {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    const auto found = endpoints_.find(id);
+    return found != endpoints_.end() ? found->second : nullptr;
 }
 
-std::shared_ptr<Endpoint> Poller::wait() {
+std::shared_ptr<Endpoint> Poller::next(bool wait) {
     epoll_event event{};
-    if (epoll_wait(epoll_.get(), &event, 1, -1) != 1) return nullptr;
-    const std::lock_guard<std::mutex> lock(mutex_);
-    const auto found = endpoints_.find(event.data.u64);
-    return found != endpoints_.end() ? found->second : nullptr;
+    if (epoll_wait(epoll_.get(), &event, 1, wait ? -1 : 0) != 1) return nullptr;
+    return find(event.data.u64);
 }
 
 }  // namespace android::socket_driver

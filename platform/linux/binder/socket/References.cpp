@@ -1,5 +1,9 @@
 #include "References.h"
 
+#include <algorithm>
+
+#include "Forked.h"
+
 namespace android::socket_driver {
 
 uint64_t References::give(Link& link, const sp<BBinder>& object) {
@@ -12,25 +16,31 @@ uint64_t References::give(Link& link, const sp<BBinder>& object) {
     if (gift.count++ == 0) {
         gift.object = object;
         ++node.links;
+        ++gifts_;
     }
     return node.id;
 }
 
-void References::takeBack(Link& link, uint64_t node, uint64_t count) {
+sp<BBinder> References::takeBack(Link& link, uint64_t node, uint64_t count) {
     sp<BBinder> dropped;
-    const std::lock_guard<std::mutex> lock(mutex_);
-    const auto peer = peers_.find(&link);
-    if (peer == peers_.end()) return;
-    const auto gift = peer->second.gifts.find(node);
-    if (gift == peer->second.gifts.end()) return;
-    if (gift->second.count > count) {
-        gift->second.count -= count;
-        return;
+    bool isOver = false;
+    {
+        const std::lock_guard<std::mutex> lock(mutex_);
+        const auto peer = peers_.find(&link);
+        if (peer == peers_.end()) return nullptr;
+        const auto gift = peer->second.gifts.find(node);
+        if (gift == peer->second.gifts.end()) return nullptr;
+        if (gift->second.count > count) {
+            gift->second.count -= count;
+            return nullptr;
+        }
+        dropGift(gift->second);
+        dropped = gift->second.object;
+        peer->second.gifts.erase(gift);
+        isOver = forgetPeerIfEmpty(link);
     }
-    dropGift(gift->second);
-    dropped = gift->second.object;
-    peer->second.gifts.erase(gift);
-    forgetPeerIfEmpty(link);
+    if (isOver) link.cut();
+    return dropped;
 }
 
 sp<BBinder> References::find(const Link& link, uint64_t node) {
@@ -43,18 +53,33 @@ sp<BBinder> References::find(const Link& link, uint64_t node) {
 
 int32_t References::adopt(const std::shared_ptr<Link>& link, uint64_t node) {
     const std::lock_guard<std::mutex> lock(mutex_);
-    int32_t& number = peers_[link.get()].handles[node];
+    const std::pair<Identity, uint64_t> origin(link->identity(), node);
+    int32_t& number = numbers_[origin];
     if (number == 0) {
         do {
             lastHandle_ = lastHandle_ == INT32_MAX ? 1 : lastHandle_ + 1;
         } while (handles_.count(lastHandle_) != 0);
         number = lastHandle_;
-        handles_[number].route = {link, node};
+        handles_[number].origin = origin;
     }
     Handle& handle = handles_[number];
-    ++handle.references;
     ++handle.users;
+    const auto known = findReceived(handle, *link);
+    if (known != handle.received.end()) {
+        ++known->count;
+    } else {
+        handle.received.push_back({link, 1});
+        peers_[link.get()].handles.insert(number);
+    }
     return number;
+}
+
+int32_t References::share(const Identity& owner, uint64_t node) {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    const auto number = numbers_.find({owner, node});
+    if (number == numbers_.end()) return 0;
+    ++handles_[number->second].users;
+    return number->second;
 }
 
 void References::acquire(int32_t number) {
@@ -63,33 +88,62 @@ void References::acquire(int32_t number) {
     if (handle != handles_.end()) ++handle->second.users;
 }
 
+uint64_t References::acquireFrom(const Link& link, int32_t number) {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    const auto handle = handles_.find(number);
+    if (handle == handles_.end() || findReceived(handle->second, link) == handle->second.received.end()) return 0;
+    ++handle->second.users;
+    return handle->second.origin.second;
+}
+
 void References::release(int32_t number) {
+    if (isForked()) return;
     Handle dropped;
+    std::vector<std::shared_ptr<Link>> over;
     {
         const std::lock_guard<std::mutex> lock(mutex_);
         const auto handle = handles_.find(number);
         if (handle == handles_.end() || --handle->second.users > 0) return;
         dropped = std::move(handle->second);
         handles_.erase(handle);
-        peers_[dropped.route.link.get()].handles.erase(dropped.route.node);
-        forgetPeerIfEmpty(*dropped.route.link);
+        numbers_.erase(dropped.origin);
+        for (const Received& received : dropped.received) {
+            peers_[received.link.get()].handles.erase(number);
+            if (forgetPeerIfEmpty(*received.link)) over.push_back(received.link);
+        }
     }
-    dropped.route.link->releaseReferences(dropped.route.node, dropped.references);
+    for (const Received& received : dropped.received) {
+        received.link->releaseReferences(dropped.origin.second, received.count);
+    }
+    for (const std::shared_ptr<Link>& link : over) link->cut();
 }
 
 bool References::route(int32_t number, Route& route) {
     const std::lock_guard<std::mutex> lock(mutex_);
     const auto handle = handles_.find(number);
     if (handle == handles_.end()) return false;
-    route = handle->second.route;
+    const std::vector<Received>& received = handle->second.received;
+    const auto alive =
+        std::find_if(received.begin(), received.end(), [](const Received& one) { return !one.link->dead(); });
+    route = {(alive != received.end() ? *alive : received.front()).link, handle->second.origin.second};
     return true;
+}
+
+bool References::isDead(const Handle& handle) {
+    return std::all_of(handle.received.begin(), handle.received.end(),
+                       [](const Received& received) { return received.link->dead(); });
+}
+
+std::vector<References::Received>::iterator References::findReceived(Handle& handle, const Link& link) {
+    return std::find_if(handle.received.begin(), handle.received.end(),
+                        [&link](const Received& received) { return received.link.get() == &link; });
 }
 
 status_t References::mourn(int32_t number, const wp<BpBinder>& proxy) {
     const std::lock_guard<std::mutex> lock(mutex_);
     const auto handle = handles_.find(number);
     if (handle == handles_.end()) return BAD_TYPE;
-    if (handle->second.route.link->dead()) return DEAD_OBJECT;
+    if (isDead(handle->second)) return DEAD_OBJECT;
     handle->second.mourned = true;
     handle->second.mourner = proxy;
     return OK;
@@ -103,41 +157,37 @@ status_t References::forget(int32_t number) {
     return OK;
 }
 
-bool References::anybodyMourns(const Link& link) {
+References::Estate References::end(Link& link) {
+    Estate estate;
     const std::lock_guard<std::mutex> lock(mutex_);
     const auto peer = peers_.find(&link);
-    if (peer == peers_.end()) return false;
-    for (const auto& [node, number] : peer->second.handles) {
-        if (handles_[number].mourned) return true;
+    if (peer == peers_.end()) return estate;
+    for (const auto& [node, gift] : peer->second.gifts) {
+        dropGift(gift);
+        estate.objects.push_back(gift.object);
     }
-    return false;
-}
-
-std::vector<wp<BpBinder>> References::end(Link& link) {
-    std::vector<wp<BpBinder>> mourners;
-    std::unordered_map<uint64_t, Gift> dropped;
-    const std::lock_guard<std::mutex> lock(mutex_);
-    const auto peer = peers_.find(&link);
-    if (peer == peers_.end()) return mourners;
-    dropped.swap(peer->second.gifts);
-    for (const auto& [node, gift] : dropped) dropGift(gift);
-    for (const auto& [node, number] : peer->second.handles) {
+    peer->second.gifts.clear();
+    for (const int32_t number : peer->second.handles) {
         Handle& handle = handles_[number];
-        if (handle.mourned) mourners.push_back(handle.mourner);
+        if (!handle.mourned || !isDead(handle)) continue;
+        estate.mourners.push_back(handle.mourner);
         handle.mourned = false;
     }
     forgetPeerIfEmpty(link);
-    return mourners;
+    return estate;
 }
 
 void References::dropGift(const Gift& gift) {
+    --gifts_;
     const auto node = nodes_.find(gift.object.get());
     if (node != nodes_.end() && --node->second.links == 0) nodes_.erase(node);
 }
 
-void References::forgetPeerIfEmpty(const Link& link) {
+bool References::forgetPeerIfEmpty(const Link& link) {
     const auto peer = peers_.find(&link);
-    if (peer != peers_.end() && peer->second.gifts.empty() && peer->second.handles.empty()) peers_.erase(peer);
+    if (peer == peers_.end() || !peer->second.gifts.empty() || !peer->second.handles.empty()) return false;
+    peers_.erase(peer);
+    return link.isTemporary();
 }
 
 }  // namespace android::socket_driver

@@ -19,7 +19,7 @@ namespace android::socket_driver {
 namespace {
 
 constexpr char kLogTag[] = "BinderSocket";
-constexpr size_t kMaxNameLength = 127;
+constexpr size_t kMaxNameSize = 255;
 constexpr int kBacklog = 128;
 
 // A path that everybody on the machine can create must be checked to be this user's before it is used.
@@ -46,20 +46,28 @@ sockaddr_un addressOf(const std::string& path) {
     return address;
 }
 
+bool connectTo(int socket, int path) {
+    const sockaddr_un address = addressOf(pathOf(path));
+    int result = -1;
+    do {
+        result = connect(socket, reinterpret_cast<const sockaddr*>(&address), sizeof address);
+    } while (result != 0 && errno == EINTR);
+    return result == 0;
+}
+
 }  // namespace
 
 status_t RuntimeDirectory::open(RuntimeDirectory& directory) {
     const Place place = choosePlace();
-    if (mkdir(place.path.c_str(), 0700) != 0 && errno != EEXIST) {
-        __android_log_print(ANDROID_LOG_ERROR, kLogTag, "cannot make %s: %s", place.path.c_str(), strerror(errno));
-        return -errno;
-    }
+    const auto fail = [&place](const char* what) {
+        const int error = errno;
+        __android_log_print(ANDROID_LOG_ERROR, kLogTag, "cannot %s %s: %s", what, place.path.c_str(), strerror(error));
+        return -error;
+    };
+    if (mkdir(place.path.c_str(), 0700) != 0 && errno != EEXIST) return fail("make");
     UniqueFd fd(::open(place.path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC | (place.shared ? O_NOFOLLOW : 0)));
     struct stat status {};
-    if (!fd.valid() || fstat(fd.get(), &status) != 0) {
-        __android_log_print(ANDROID_LOG_ERROR, kLogTag, "cannot open %s: %s", place.path.c_str(), strerror(errno));
-        return -errno;
-    }
+    if (!fd.valid() || fstat(fd.get(), &status) != 0) return fail("open");
     if (place.shared && (status.st_uid != geteuid() || (status.st_mode & 077) != 0)) {
         __android_log_print(ANDROID_LOG_ERROR, kLogTag, "%s is open to other users: not used", place.path.c_str());
         return PERMISSION_DENIED;
@@ -69,11 +77,11 @@ status_t RuntimeDirectory::open(RuntimeDirectory& directory) {
 }
 
 bool RuntimeDirectory::isValidName(const std::string& name) {
-    return !name.empty() && name.size() <= kMaxNameLength && name[0] != '.' && name.find('/') == std::string::npos &&
+    return !name.empty() && name.size() <= kMaxNameSize && name[0] != '.' && name.find('/') == std::string::npos &&
            name.find('\0') == std::string::npos;
 }
 
-status_t RuntimeDirectory::publish(const std::string& name, UniqueFd& listener, FileId& id) const {
+status_t RuntimeDirectory::listen(Unnamed& unnamed) const {
     unsigned long long random = 0;
     if (getrandom(&random, sizeof random, 0) != sizeof random) return -errno;
     char temporary[32];
@@ -83,35 +91,40 @@ status_t RuntimeDirectory::publish(const std::string& name, UniqueFd& listener, 
     UniqueFd fd(socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     if (!fd.valid()) return -errno;
     if (bind(fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) return -errno;
+    unnamed.temporary = temporary;
 
     // Who may reach the service is decided by the directory's permissions, not by this process's file mask.
-    struct stat status {};
     const bool ready = fchmodat(directory_.get(), temporary, 0666, 0) == 0 && ::listen(fd.get(), kBacklog) == 0 &&
-                       fstatat(directory_.get(), temporary, &status, AT_SYMLINK_NOFOLLOW) == 0 &&
-                       renameat(directory_.get(), temporary, directory_.get(), name.c_str()) == 0;
+                       identify(temporary, unnamed.file);
     if (!ready) {
         const status_t error = -errno;
-        unlinkat(directory_.get(), temporary, 0);
+        discard(unnamed);
         return error;
     }
-    id = {status.st_dev, status.st_ino};
-    listener = std::move(fd);
+    unnamed.socket = std::move(fd);
     return OK;
 }
 
-status_t RuntimeDirectory::connect(const std::string& name, UniqueFd& connection) const {
+status_t RuntimeDirectory::give(const Unnamed& unnamed, const std::string& name) const {
+    const int directory = directory_.get();
+    return renameat(directory, unnamed.temporary.c_str(), directory, name.c_str()) == 0 ? OK : -errno;
+}
+
+void RuntimeDirectory::discard(const Unnamed& unnamed) const {
+    unlinkat(directory_.get(), unnamed.temporary.c_str(), 0);
+}
+
+status_t RuntimeDirectory::connect(const std::string& name, Found& found) const {
     // By way of a descriptor: a name may be longer than an address holds.
-    const UniqueFd file(openat(directory_.get(), name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
-    if (!file.valid()) return errno == ENOENT ? NAME_NOT_FOUND : -errno;
-    const sockaddr_un address = addressOf(pathOf(file.get()));
+    found.path.reset(openat(directory_.get(), name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
+    if (!found.path.valid()) return errno == ENOENT ? NAME_NOT_FOUND : -errno;
+    struct stat status {};
+    if (fstat(found.path.get(), &status) != 0) return -errno;
+    found.file = {status.st_dev, status.st_ino};
     UniqueFd fd(socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0));
     if (!fd.valid()) return -errno;
-    int result = -1;
-    do {
-        result = ::connect(fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
-    } while (result != 0 && errno == EINTR);
-    if (result != 0) return errno == ENOENT || errno == ECONNREFUSED ? NAME_NOT_FOUND : -errno;
-    connection = std::move(fd);
+    if (!connectTo(fd.get(), found.path.get())) return errno == ECONNREFUSED ? NAME_NOT_FOUND : -errno;
+    found.connection = std::move(fd);
     return OK;
 }
 
@@ -130,10 +143,19 @@ std::vector<std::string> RuntimeDirectory::list() const {
     if (entries == nullptr) return names;
     while (const dirent* entry = readdir(entries.get())) {
         FileId id;
-        if (isValidName(entry->d_name) && identify(entry->d_name, id)) names.emplace_back(entry->d_name);
+        if (isValidName(entry->d_name) && identify(entry->d_name, id) && isListenedTo(entry->d_name)) {
+            names.emplace_back(entry->d_name);
+        }
     }
     std::sort(names.begin(), names.end());
     return names;
+}
+
+// Asks for a connection of the wrong kind, which disturbs nobody: there is another answer to it where nobody listens.
+bool RuntimeDirectory::isListenedTo(const char* name) const {
+    const UniqueFd path(openat(directory_.get(), name, O_PATH | O_NOFOLLOW | O_CLOEXEC));
+    const UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    return path.valid() && fd.valid() && !connectTo(fd.get(), path.get()) && errno == EPROTOTYPE;
 }
 
 }  // namespace android::socket_driver

@@ -24,19 +24,36 @@ public:
     // directory under /tmp is not this user's alone.
     static status_t open(RuntimeDirectory& directory);
 
-    // A service name is a file name: not empty, no more than 127 characters, no '/', no '.' in front.
+    // A service name is a file name: not empty, no more than 255 bytes, no '/', no '.' in front.
     static bool isValidName(const std::string& name);
 
-    // Binds and listens, and only then gives the socket its name, in one step: whoever held the name before,
-    // alive or dead, is replaced, and nobody meets a socket that does not listen yet.
-    status_t publish(const std::string& name, UniqueFd& listener, FileId& id) const;
+    // A socket that listens, but has no name yet that anybody knows.
+    struct Unnamed {
+        UniqueFd socket;
+        FileId file;
+        std::string temporary;
+    };
+    status_t listen(Unnamed& unnamed) const;
+    // In one step: whoever held the name before, alive or dead, is replaced.
+    status_t give(const Unnamed& unnamed, const std::string& name) const;
+    void discard(const Unnamed& unnamed) const;
+
+    // Somebody who listens, or at least a file that tells who did.
+    struct Found {
+        UniqueFd connection;
+        UniqueFd path;  // keeps the file's number from being used for another
+        FileId file;
+    };
     // NAME_NOT_FOUND when nobody listens under the name.
-    status_t connect(const std::string& name, UniqueFd& connection) const;
+    status_t connect(const std::string& name, Found& found) const;
     // False when there is no socket of that name.
     bool identify(const std::string& name, FileId& id) const;
+    // The names under which somebody listens.
     std::vector<std::string> list() const;
 
 private:
+    bool isListenedTo(const char* name) const;
+
     UniqueFd directory_;
 };
 

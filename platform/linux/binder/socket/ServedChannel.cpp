@@ -1,72 +1,92 @@
 #include "ServedChannel.h"
 
-#include <fcntl.h>
 #include <sys/socket.h>
 
 #include <cerrno>
+#include <utility>
 
 namespace android::socket_driver {
+
+ServedChannel::ServedChannel(TransactionServer& server, Poller& poller, std::shared_ptr<Link> link, Purpose purpose,
+                             UniqueFd socket, Driver::Caller caller)
+    : server_(server),
+      poller_(poller),
+      link_(std::move(link)),
+      purpose_(purpose),
+      socket_(std::move(socket)),
+      caller_(caller) {}
 
 void ServedChannel::onReady() {
     if (!baton_.take()) return;
     do {
-        if (hasUnsent() && !sendUnsent()) continue;
-        Frame frame;
-        switch (reader_.read(socket_.get(), MSG_DONTWAIT, frame)) {
-            case FrameReader::Result::kFrame:
-                if (frame.header.type != FrameType::kTransaction) {
-                    server_.peerMisbehaved(*this);
-                    return;
-                }
-                // The peer waits for the reply now. What it sends after that is news to the poller, so there is
-                // no need to look for more.
-                server_.transactionArrived(*this, frame);
-                break;
-            case FrameReader::Result::kAgain: break;
-            case FrameReader::Result::kClosed: server_.channelClosed(*this); return;
-            case FrameReader::Result::kViolation:
-            case FrameReader::Result::kNoMemory: server_.peerMisbehaved(*this); return;
-        }
+        if (!readFrames()) return;
+        if (muted_) return resume();
     } while (!baton_.giveBack());
 }
 
-int ServedChannel::send(const OutgoingFrame& frame) {
+// False when somebody else holds the channel now, or nobody needs to any more.
+bool ServedChannel::readFrames() {
+    if (unsent_ != nullptr && !sendUnsent()) return true;
+    for (;;) {
+        Arrival arrival;
+        const FrameReader::Result result = reader_.read(socket_.get(), MSG_DONTWAIT, arrival.frame);
+        if (result == FrameReader::Result::kAgain) return true;
+        if (result == FrameReader::Result::kClosed) {
+            server_.channelClosed(*this);
+            return false;
+        }
+        const bool isTransaction =
+            result == FrameReader::Result::kFrame && arrival.frame.header.type == FrameType::kTransaction;
+        if (!isTransaction && result != FrameReader::Result::kReceipt) {
+            link_->cut();
+            return false;
+        }
+        // Whatever comes behind a reply says that it was taken in.
+        sentHandles_.clear();
+        if (!isTransaction) continue;
+        arrival.channel = std::static_pointer_cast<ServedChannel>(shared_from_this());
+        // The peer waits for the reply now. What it sends after that is news to the poller, so there is no need to look
+        // for more.
+        return server_.transactionArrived(std::move(arrival));
+    }
+}
+
+int ServedChannel::send(const OutgoingFrame& frame, UsedHandles handles) {
     size_t sent = 0;
     const int error = sendFrame(socket_.get(), frame, sent, MSG_DONTWAIT);
-    if (error != EAGAIN) return error;
-
-    if (sent == 0) {
-        // The descriptors travel with the first byte, so they must be kept as well.
-        for (const int descriptor : frame.descriptors) {
-            UniqueFd copy(fcntl(descriptor, F_DUPFD_CLOEXEC, 0));
-            if (!copy.valid()) {
-                unsentDescriptors_.clear();
-                return errno;
-            }
-            unsentDescriptors_.push_back(std::move(copy));
-        }
+    if (error != 0 && error != EAGAIN) return error;
+    if (error == EAGAIN) {
+        unsent_ = UnsentFrame::copy(frame, sent);
+        if (unsent_ == nullptr && sent == 0) return ENOMEM;
+        // Half a reply is worse than none.
+        if (unsent_ == nullptr) shutdown(socket_.get(), SHUT_RDWR);
+        poller_.change(*this, events());
     }
-    unsent_ = frame.rest(sent);
-    unsentAt_ = 0;
-    poller_.wantWritable(*this, true);
+    sentHandles_ = std::move(handles);
     return 0;
 }
 
 bool ServedChannel::sendUnsent() {
-    while (hasUnsent()) {
-        std::vector<int> descriptors;
-        for (const UniqueFd& descriptor : unsentDescriptors_) descriptors.push_back(descriptor.get());
-        const ssize_t count =
-            sendBytes(socket_.get(), unsent_.data() + unsentAt_, unsent_.size() - unsentAt_, descriptors, MSG_DONTWAIT);
-        // Any other error is the peer's end, which the next read sees.
-        if (count < 0) return errno != EAGAIN && errno != EWOULDBLOCK;
-        unsentAt_ += static_cast<size_t>(count);
-        unsentDescriptors_.clear();
-    }
-    unsent_ = {};
-    unsentAt_ = 0;
-    poller_.wantWritable(*this, false);
+    const int error = unsent_->send(socket_.get());
+    if (error == EAGAIN) return false;
+    // Where the peer is gone, the next read sees it.
+    if (error != 0) shutdown(socket_.get(), SHUT_RDWR);
+    unsent_ = nullptr;
+    poller_.change(*this, events());
     return true;
+}
+
+void ServedChannel::mute() {
+    if (muted_) return;
+    muted_ = true;
+    poller_.change(*this, 0);
+}
+
+void ServedChannel::resume() {
+    muted_ = false;
+    const uint32_t wanted = events();
+    baton_.drop();
+    poller_.change(*this, wanted);
 }
 
 }  // namespace android::socket_driver

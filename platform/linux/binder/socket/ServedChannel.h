@@ -2,23 +2,28 @@
 #pragma once
 
 #include <memory>
-#include <vector>
 
 #include "Frame.h"
 #include "Link.h"
+#include "References.h"
 
 namespace android::socket_driver {
 
 class ServedChannel;
 
+// A transaction that has come in and waits for a thread.
+struct Arrival {
+    std::shared_ptr<ServedChannel> channel;
+    Frame frame;
+};
+
 class TransactionServer {
 public:
-    // One transaction has come in. Answers with channel.send.
-    virtual void transactionArrived(ServedChannel& channel, Frame& frame) = 0;
+    // Called with the channel held. True when the transaction was answered; false when it is left to somebody
+    // who will answer and then resume the channel.
+    virtual bool transactionArrived(Arrival arrival) = 0;
     // The peer closed the channel.
     virtual void channelClosed(ServedChannel& channel) = 0;
-    // The peer said what no peer says.
-    virtual void peerMisbehaved(ServedChannel& channel) = 0;
 
 protected:
     ~TransactionServer() = default;
@@ -28,35 +33,48 @@ protected:
 // for one parcel and no thread.
 class ServedChannel : public Endpoint {
 public:
-    ServedChannel(TransactionServer& server, Poller& poller, std::shared_ptr<Link> link, UniqueFd socket,
-                  Driver::Caller caller)
-        : server_(server), poller_(poller), link_(std::move(link)), socket_(std::move(socket)), caller_(caller) {}
+    ServedChannel(TransactionServer& server, Poller& poller, std::shared_ptr<Link> link, Purpose purpose,
+                  UniqueFd socket, Driver::Caller caller);
 
     int fd() const override { return socket_.get(); }
     void onReady() override;
 
     const std::shared_ptr<Link>& link() const { return link_; }
+    Purpose purpose() const { return purpose_; }
     const Driver::Caller& caller() const { return caller_; }
 
-    // Sends what the peer will take and keeps the rest for later. 0, or errno when nothing was sent or kept.
-    int send(const OutgoingFrame& frame);
+    // From now on the peer is listened to.
+    bool start() { return poller_.add(shared_from_this(), events()); }
+
+    // What follows is for whoever holds the channel.
+
+    // Sends what the peer will take and keeps the rest for later, with the handles the frame speaks of. 0, or errno
+    // when nothing was sent or kept.
+    int send(const OutgoingFrame& frame, UsedHandles handles);
+    // The channel is read by somebody else for a while: its news need not wake anyone.
+    void mute();
+    // Lets go of the channel and has the poller look at it again.
+    void resume();
+
 
 private:
-    bool hasUnsent() const { return unsentAt_ < unsent_.size(); }
+    bool readFrames();
     // False when the peer will not take all of it yet.
     bool sendUnsent();
+    uint32_t events() const { return Poller::kEdge | (unsent_ != nullptr ? Poller::kWritable : Poller::kReadable); }
 
     TransactionServer& server_;
     Poller& poller_;
     const std::shared_ptr<Link> link_;
+    const Purpose purpose_;
     const UniqueFd socket_;
     const Driver::Caller caller_;
     Baton baton_;
     // Only touched by whoever holds the baton.
     FrameReader reader_;
-    std::vector<uint8_t> unsent_;
-    size_t unsentAt_ = 0;
-    std::vector<UniqueFd> unsentDescriptors_;
+    std::unique_ptr<UnsentFrame> unsent_;
+    UsedHandles sentHandles_;
+    bool muted_ = false;
 };
 
 }  // namespace android::socket_driver

@@ -1,12 +1,15 @@
 #include "SocketDriver.h"
 
-#include <binder/Parcel.h>
-#include <fcntl.h>
-#include <sys/socket.h>
+#include <android/log.h>
+#include <pthread.h>
+#include <signal.h>
+#include <sys/random.h>
 
-#include <algorithm>
-#include <cerrno>
+#include <cstring>
 #include <utility>
+
+#include "Forked.h"
+#include "SocketServiceManager.h"
 
 namespace android {
 
@@ -14,313 +17,168 @@ std::unique_ptr<Driver> openSocketDriver(Driver::Process& process) {
     socket_driver::RuntimeDirectory directory;
     if (socket_driver::RuntimeDirectory::open(directory) != OK) return nullptr;
     auto driver = std::make_unique<socket_driver::SocketDriver>(process, std::move(directory));
-    if (!driver->valid()) return nullptr;
+    if (!driver->open()) return nullptr;
     return driver;
 }
 
 namespace socket_driver {
 namespace {
 
+constexpr char kTag[] = "BinderSocket";
 constexpr std::chrono::milliseconds kQuiesceLimit{1000};
 
-bool isUnixSocket(int fd, int type) {
-    int value = 0;
-    socklen_t size = sizeof value;
-    if (getsockopt(fd, SOL_SOCKET, SO_DOMAIN, &value, &size) != 0 || value != AF_UNIX) return false;
-    size = sizeof value;
-    return getsockopt(fd, SOL_SOCKET, SO_TYPE, &value, &size) == 0 && value == type;
+uint64_t randomNumber() {
+    uint64_t number = 0;
+    return getrandom(&number, sizeof number, 0) == sizeof number ? number : static_cast<uint64_t>(getpid());
 }
-
-bool isGone(int error) { return error == EPIPE || error == ECONNRESET; }
 
 }  // namespace
 
 thread_local const SocketDriver::Serving* SocketDriver::serving_ = nullptr;
-thread_local std::vector<const BBinder*> SocketDriver::queued_;
+thread_local bool SocketDriver::keepsHouse_ = false;
+
+// Stands for the pool's connections among the housekeeper's.
+class SocketDriver::Sorter : public Endpoint {
+public:
+    explicit Sorter(SocketDriver& driver) : driver_(driver) {}
+    int fd() const override { return driver_.pool_.fd(); }
+    void onReady() override { driver_.sortArrivals(); }
+
+private:
+    SocketDriver& driver_;
+};
 
 SocketDriver::SocketDriver(Process& process, RuntimeDirectory directory)
     : process_(process),
+      instance_(randomNumber()),
+      errands_(std::make_shared<Errands>(threads_)),
+      sorter_(std::make_shared<Sorter>(*this)),
       translator_(references_, *this),
       directory_(*this, std::move(directory)),
-      serviceManager_(new SocketServiceManager(directory_)) {}
+      serviceManager_(new SocketServiceManager(directory_)),
+      chains_([this](Arrival arrival) { leaveToPool(std::move(arrival)); }) {}
+
+bool SocketDriver::open() {
+    watchForForks();
+    return pool_.valid() && house_.valid() && errands_->valid() &&
+           pool_.add(errands_, Poller::kReadable | Poller::kEdge) && house_.add(sorter_, Poller::kReadable);
+}
 
 status_t SocketDriver::requestDeathNotification(int32_t handle, const wp<BpBinder>& proxy) {
     return references_.mourn(handle, proxy);
 }
 
+// -- The pool
+
 void SocketDriver::joinThreadPool(bool isMain) {
-    threads_.beginWait();
-    threads_.joined(!isMain);
+    // The program may end the thread while it runs a call, and it may have been the last.
+    struct Leaving {
+        SocketDriver& driver;
+        ~Leaving() { driver.sortFromNowOn(); }
+    };
+    const Leaving leaving{*this};
+    const ThreadBudget::Member member(threads_, !isMain);
+    leaveArrivals();
     for (;;) {
-        std::shared_ptr<Endpoint> endpoint = poller_.wait();
-        threads_.endWait();
-        if (endpoint != nullptr) endpoint->onReady();
-        endpoint.reset();
-        for (const BBinder* target : std::exchange(queued_, {})) {
-            asyncCalls_.run(target, [this](AsyncCall& call) {
-                Parcel reply;
-                run(call, *call.data, reply, nullptr);
-            });
-        }
+        work();
         threads_.beginWait();
     }
 }
 
-void SocketDriver::quiesce() { running_.stop(kQuiesceLimit); }
-
-// -- Links
-
-std::shared_ptr<Link> SocketDriver::addLink(UniqueFd control, Caller peer, uint64_t instance) {
-    auto link = std::make_shared<Link>(static_cast<LinkEvents&>(*this), std::move(control), peer, instance);
-    return poller_.add(link, true) ? link : nullptr;
-}
-
-void SocketDriver::channelOffered(const std::shared_ptr<Link>& link, UniqueFd channel) {
-    // Who made the channel is who calls on it: the kernel noted it when the pair was made.
-    const Caller caller = peerOf(channel.get());
-    const uint64_t id = poller_.reserveId();
-    if (!isUnixSocket(channel.get(), SOCK_STREAM) || !link->addServed(id)) {
-        link->cut();
+// One errand, or whatever one connection has; counted as idle by the caller until there is something to do.
+void SocketDriver::work() {
+    Errand errand;
+    if (errands_->take(errand, true)) {
+        threads_.endWait();
+        doErrand(std::move(errand));
         return;
     }
-    auto served = std::make_shared<ServedChannel>(static_cast<TransactionServer&>(*this), poller_, link,
-                                                  std::move(channel), caller);
-    served->id = id;
-    if (!poller_.add(served)) link->removeServed(id);
+    const std::shared_ptr<Endpoint> endpoint = pool_.next();
+    threads_.endWait();
+    if (endpoint != nullptr) endpoint->onReady();
 }
 
-void SocketDriver::referencesReleased(Link& link, uint64_t node, uint64_t count) {
-    references_.takeBack(link, node, count);
-}
-
-void SocketDriver::linkEnded(const std::shared_ptr<Link>& link) {
-    link->cut();
-    for (const uint64_t id : link->takeServed()) {
-        // A thread may still run a transaction for the channel; it finds that nobody wants the reply.
-        if (const std::shared_ptr<Endpoint> channel = poller_.remove(id)) shutdown(channel->fd(), SHUT_RDWR);
-    }
-    directory_.forget(link);
-    poller_.remove(link->id);
-    for (const wp<BpBinder>& mourner : references_.end(*link)) {
-        if (const sp<BpBinder> proxy = mourner.promote()) proxy->sendObituary();
-    }
-}
-
-void SocketDriver::channelClosed(ServedChannel& channel) {
-    channel.link()->removeServed(channel.id);
-    poller_.remove(channel.id);
-}
-
-void SocketDriver::peerMisbehaved(ServedChannel& channel) { linkEnded(channel.link()); }
-
-status_t SocketDriver::introduce(const References::Route& route, UniqueFd& control) {
-    Parcel data, reply;
-    data.writeInt64(static_cast<int64_t>(route.node));
-    const status_t status = call(route.link, kDirectoryNode, kIntroduce, data, &reply, 0);
-    if (status != OK) return status;
-    control.reset(fcntl(reply.readFileDescriptor(), F_DUPFD_CLOEXEC, 0));
-    return control.valid() ? OK : FAILED_TRANSACTION;
-}
-
-std::shared_ptr<Link> SocketDriver::meet(UniqueFd control) {
-    if (!isUnixSocket(control.get(), SOCK_SEQPACKET)) return nullptr;
-    const Caller peer = peerOf(control.get());
-    return addLink(std::move(control), peer, 0);
-}
-
-// -- Calling
-
-status_t SocketDriver::transact(int32_t handle, uint32_t code, const Parcel& data, Parcel* reply, uint32_t flags) {
-    References::Route route;
-    if (!references_.route(handle, route)) return BAD_TYPE;
-    return call(route.link, route.node, code, data, reply, flags);
-}
-
-status_t SocketDriver::call(const std::shared_ptr<Link>& link, uint64_t node, uint32_t code, const Parcel& data,
-                            Parcel* reply, uint32_t flags) {
-    if (link->dead()) return DEAD_OBJECT;
-    OutgoingParcel out;
-    status_t status = translator_.pack(data, *link, out);
-    if (status != OK) return status;
-    FrameHeader& header = out.frame.header;
-    header.type = FrameType::kTransaction;
-    header.code = code;
-    header.flags = flags;
-    header.target = node;
-
-    // A oneway call is only accepted by the peer, not run, before it answers: nothing can come back.
-    const bool oneway = (flags & IBinder::FLAG_ONEWAY) != 0;
-    const int back = oneway ? -1 : channelBackTo(*link);
-    bool reusable = false;
-    if (back >= 0) return exchange(link, back, out, reply, reusable);
-
-    UniqueFd channel = link->takeChannel(status);
-    if (!channel.valid()) {
-        translator_.takeBack(*link, out);
-        return status == DEAD_OBJECT ? lose(link) : status;
-    }
-    status = exchange(link, channel.get(), out, oneway ? nullptr : reply, reusable);
-    link->returnChannel(std::move(channel), reusable);
-    return status;
-}
-
-// The channel on which this thread serves the link's peer, whose own thread waits there and can serve in turn.
-int SocketDriver::channelBackTo(const Link& link) {
-    for (const Serving* serving = serving_; serving != nullptr; serving = serving->outer) {
-        if (serving->link == &link) return serving->channel;
-    }
-    return -1;
-}
-
-status_t SocketDriver::exchange(const std::shared_ptr<Link>& link, int channel, OutgoingParcel& out, Parcel* reply,
-                                bool& reusable) {
-    size_t sent = 0;
-    const int error = sendFrame(channel, out.frame, sent, 0);
-    if (error != 0) {
-        translator_.takeBack(*link, out);
-        if (sent != 0 || isGone(error)) return lose(link);
-        reusable = true;  // refused as a whole: a descriptor that is not open, or too many under way
-        return FAILED_TRANSACTION;
-    }
-
-    const bool counts = serving_ != nullptr;
-    if (counts) {
-        threads_.beginCall();
-        keepSpareThread();
-    }
-    status_t status = DEAD_OBJECT;
-    FrameReader reader;
-    for (Frame frame; reader.read(channel, 0, frame) == FrameReader::Result::kFrame;) {
-        if (frame.header.type == FrameType::kReply) {
-            reusable = true;
-            status = takeReply(frame, link, reply);
-            break;
-        }
-        // Oneway calls never come this way: nobody would run them once this thread has its reply.
-        if ((frame.header.flags & IBinder::FLAG_ONEWAY) != 0) break;
-        Parcel answerParcel;
-        const status_t served = serve(link, link->peer(), channel, frame, answerParcel);
-        const bool answered = answer(*link, served, answerParcel, [&](const OutgoingFrame& outgoing) {
-            size_t count = 0;
-            return sendFrame(channel, outgoing, count, 0);
-        });
-        if (!answered) break;
-    }
-    if (counts) threads_.endCall();
-    return reusable ? status : lose(link);
-}
-
-status_t SocketDriver::takeReply(Frame& frame, const std::shared_ptr<Link>& link, Parcel* reply) {
-    const auto status = static_cast<status_t>(frame.header.code);
-    // What comes with an answer that nobody asked for is unpacked all the same, to be given back.
-    Parcel unwanted;
-    Parcel& target = reply != nullptr && status == OK ? *reply : unwanted;
-    const status_t unpacked = translator_.unpack(frame, link, target);
-    if (unpacked == BAD_VALUE) {
-        linkEnded(link);
-        return DEAD_OBJECT;
-    }
-    return status != OK ? status : unpacked;
-}
-
-status_t SocketDriver::lose(const std::shared_ptr<Link>& link) {
-    link->cut();
-    // Usually the poller has seen it as well, and a thread of the pool brings the news to those who asked for it.
-    // Where there is neither, the rest is done here.
-    if (!threads_.hasThreads() && !references_.anybodyMourns(*link)) linkEnded(link);
-    return DEAD_OBJECT;
-}
-
-// -- Serving
-
-void SocketDriver::transactionArrived(ServedChannel& channel, Frame& frame) {
-    Parcel reply;
-    const status_t status = serve(channel.link(), channel.caller(), channel.fd(), frame, reply);
-    answer(*channel.link(), status, reply, [&](const OutgoingFrame& outgoing) { return channel.send(outgoing); });
-}
-
-status_t SocketDriver::serve(const std::shared_ptr<Link>& link, const Caller& caller, int channel, Frame& frame,
-                             Parcel& reply) {
-    const FrameHeader header = frame.header;
-    auto data = std::make_unique<Parcel>();
-    const status_t status = translator_.unpack(frame, link, *data);
-    if (status == BAD_VALUE) linkEnded(link);
-    if (status != OK) return status;
-
-    if (header.target == kDirectoryNode) return serveDirectory(*link, header.code, *data, reply);
-    AsyncCall call{references_.find(*link, header.target), caller, header.code, header.flags, nullptr};
-    if (call.target == nullptr) return FAILED_TRANSACTION;
-    if ((header.flags & IBinder::FLAG_ONEWAY) == 0) {
-        const Serving serving{link.get(), channel, serving_};
-        return run(call, *data, reply, &serving);
-    }
-    const BBinder* target = call.target.get();
-    call.data = std::move(data);
-    const AsyncCalls::Admission admission = asyncCalls_.admit(std::move(call));
-    if (admission == AsyncCalls::Admission::kQueuedFirst) queued_.push_back(target);
-    return admission == AsyncCalls::Admission::kRefused ? FAILED_TRANSACTION : OK;
-}
-
-status_t SocketDriver::run(const AsyncCall& call, const Parcel& data, Parcel& reply, const Serving* serving) {
+void SocketDriver::doErrand(Errand errand) {
     const RunningCalls::Call running(running_);
-    keepSpareThread();
-    const Serving* outer = std::exchange(serving_, serving);
-    const status_t status = process_.execute(call.target, call.caller, call.code, data, &reply, call.flags);
-    serving_ = outer;
-    return status;
+    keepReader();
+    const Errand own = std::move(errand);  // what it holds goes away while the call still counts
+    own.run();
 }
 
-template <typename Send>
-bool SocketDriver::answer(Link& link, status_t status, const Parcel& reply, Send send) {
-    OutgoingParcel out;
-    if (status == OK) status = translator_.pack(reply, link, out);
-    if (status != OK) out = OutgoingParcel();
-    out.frame.header.magic = kMagic;
-    out.frame.header.type = FrameType::kReply;
-    out.frame.header.code = static_cast<uint32_t>(status);
-    const int error = send(out.frame);
-    if (error == 0) return true;
-    translator_.takeBack(link, out);
-    if (isGone(error)) return false;
-
-    // The reply cannot be carried, for a descriptor that is not open or one too many. The caller must hear of it.
-    OutgoingFrame refusal;
-    refusal.header.magic = kMagic;
-    refusal.header.type = FrameType::kReply;
-    refusal.header.code = static_cast<uint32_t>(FAILED_TRANSACTION);
-    return send(refusal) == 0;
+// On the platform a process without a pool learns of nothing. Here at least what it gave away comes back to
+// it, when one of its threads is in the driver anyway: on a thread of the driver's own, objects would go away where
+// the program expects nobody else to be at work.
+void SocketDriver::doErrandsWithoutPool() {
+    if (threads_.hasThreads() || serving_ != nullptr) return;
+    for (Errand errand; errands_->take(errand, false);) doErrand(std::exchange(errand, Errand()));
 }
 
-status_t SocketDriver::serveDirectory(Link& link, uint32_t code, const Parcel& data, Parcel& reply) {
-    switch (code) {
-        case kLookUp: {
-            const String8 name(data.readString16());
-            return reply.writeStrongBinder(directory_.published(std::string(name.string(), name.size())));
-        }
-        case kIntroduce: return makeIntroduction(link, static_cast<uint64_t>(data.readInt64()), reply);
-        default: return UNKNOWN_TRANSACTION;
+void SocketDriver::quiesce() {
+    if (!isForked()) running_.stop(kQuiesceLimit);
+}
+
+// A thread is about to run a program's code: somebody has to read what comes in meanwhile.
+void SocketDriver::keepReader() {
+    if (!threads_.hasThreads()) return;
+    ThreadBudget::Next next = threads_.next();
+    if (next == ThreadBudget::Next::kIsWanted && !process_.spawnPooledThread()) {
+        threads_.notStarted();
+        next = ThreadBudget::Next::kIsNot;
+    }
+    if (next == ThreadBudget::Next::kIsNot) sortFromNowOn();
+}
+
+// -- The housekeeper
+
+bool SocketDriver::startHousekeeper() {
+    const std::lock_guard<std::mutex> lock(houseMutex_);
+    if (hasHousekeeper_) return true;
+    pthread_attr_t attributes;
+    pthread_attr_init(&attributes);
+    pthread_attr_setdetachstate(&attributes, PTHREAD_CREATE_DETACHED);
+    // The program's signals are for the program's threads.
+    sigset_t all, before;
+    sigfillset(&all);
+    pthread_sigmask(SIG_SETMASK, &all, &before);
+    pthread_t thread;
+    const auto keep = [](void* driver) -> void* {
+        static_cast<SocketDriver*>(driver)->keepHouse();
+        return nullptr;
+    };
+    const int error = pthread_create(&thread, &attributes, keep, this);
+    pthread_sigmask(SIG_SETMASK, &before, nullptr);
+    pthread_attr_destroy(&attributes);
+    if (error != 0) __android_log_print(ANDROID_LOG_ERROR, kTag, "There is no thread to be had: %s", strerror(error));
+    hasHousekeeper_ = error == 0;
+    return hasHousekeeper_;
+}
+
+void SocketDriver::keepHouse() {
+    pthread_setname_np(pthread_self(), "Binder_house");
+    keepsHouse_ = true;
+    for (;;) {
+        if (const std::shared_ptr<Endpoint> endpoint = house_.next()) endpoint->onReady();
     }
 }
 
-status_t SocketDriver::makeIntroduction(Link& link, uint64_t node, Parcel& reply) {
-    const sp<BBinder> object = references_.find(link, node);
-    if (object == nullptr) return NAME_NOT_FOUND;
-    int ends[2];
-    if (socketpair(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0, ends) != 0) return -errno;
-    UniqueFd own(ends[0]);
-    UniqueFd passed(ends[1]);
-    // Whoever will hold the other end is known by what it sends first.
-    const int on = 1;
-    setsockopt(own.get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on);
-    const std::shared_ptr<Link> introduced = addLink(std::move(own), {0, static_cast<uid_t>(-1)}, 0);
-    if (introduced == nullptr) return NO_MEMORY;
-    // The node's number is the process's own, so it is the same on the new link.
-    references_.give(*introduced, object);
-    return reply.writeFileDescriptor(passed.release(), true);
+void SocketDriver::sortArrivals() {
+    if (leaveArrivals()) return;
+    if (const std::shared_ptr<Endpoint> endpoint = pool_.next(false)) endpoint->onReady();
 }
 
-void SocketDriver::keepSpareThread() {
-    if (threads_.hasThreads() && threads_.wantsThread()) process_.spawnPooledThread();
+// False while no thread of the pool would see to them.
+bool SocketDriver::leaveArrivals() {
+    const std::lock_guard<std::mutex> lock(houseMutex_);
+    if (threads_.idle() == 0) return false;
+    sorts_ = false;
+    house_.change(*sorter_, 0);
+    return true;
+}
+
+void SocketDriver::sortFromNowOn() {
+    const std::lock_guard<std::mutex> lock(houseMutex_);
+    if (std::exchange(sorts_, true)) return;
+    house_.change(*sorter_, Poller::kReadable);
 }
 
 }  // namespace socket_driver

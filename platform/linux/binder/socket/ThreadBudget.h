@@ -7,8 +7,7 @@
 namespace android::socket_driver {
 
 // One thread waits for work as long as the budget allows: whoever starts to work and leaves nobody waiting asks
-// for another. A thread that waits for a reply of its own does not count against the budget, or a chain of
-// calls that comes back to a process whose threads are all waiting would never end.
+// for another.
 class ThreadBudget {
 public:
     void setMax(size_t max) { max_ = max; }
@@ -16,39 +15,54 @@ public:
     // A pool thread is about to wait for work, and has found some.
     void beginWait() { ++idle_; }
     void endWait() { --idle_; }
-    // A pool thread is about to wait for a reply, and has it.
-    void beginCall() { ++calling_; }
-    void endCall() { --calling_; }
+    size_t idle() const { return idle_; }
 
-    // True when one more thread is to be started: the caller starts it.
-    bool wantsThread() {
-        if (idle_ > 0 || starting_.exchange(true)) return false;
-        if (spawned_ < limit()) {
+    enum class Next {
+        kWaits,     // a thread waits for work, or soon will
+        kIsWanted,  // the caller starts one more, and tells if it could not
+        kIsNot,     // all there may be are busy
+    };
+    Next next() {
+        if (idle_ > 0) return Next::kWaits;
+        if (starting_.exchange(true)) return Next::kWaits;
+        if (spawned_ < max_) {
             ++spawned_;
-            return true;
+            return Next::kIsWanted;
         }
         starting_ = false;
-        return false;
+        return Next::kIsNot;
     }
-    // A thread has joined the pool and waits for work for the first time. Only now may the next be asked for.
-    void joined(bool asked) {
-        ++joined_;
-        if (asked) starting_ = false;
+    void notStarted() {
+        --spawned_;
+        starting_ = false;
     }
+
+    // A thread of the pool, for as long as this lives. Only when it waits for work for the first time may the next
+    // be asked for.
+    class Member {
+    public:
+        Member(ThreadBudget& budget, bool spawned) : budget_(budget) {
+            budget_.beginWait();
+            ++budget_.joined_;
+            spawned_ = spawned && budget_.starting_.exchange(false);
+        }
+        // Only a thread that was ended by the program gets here: while it worked, so it is not idle.
+        ~Member() {
+            --budget_.joined_;
+            if (spawned_) --budget_.spawned_;
+        }
+        Member(const Member&) = delete;
+        Member& operator=(const Member&) = delete;
+
+    private:
+        ThreadBudget& budget_;
+        bool spawned_;
+    };
     bool hasThreads() const { return joined_ > 0; }
 
 private:
-    // However deep calls are nested, a process keeps to a multiple of its maximum.
-    static constexpr size_t kNestingFactor = 4;
-
-    size_t limit() const {
-        const size_t raised = max_ + calling_;
-        return raised < max_ * kNestingFactor ? raised : max_ * kNestingFactor;
-    }
-
     std::atomic<size_t> max_{15};
     std::atomic<size_t> idle_{0};
-    std::atomic<size_t> calling_{0};
     std::atomic<size_t> spawned_{0};
     std::atomic<size_t> joined_{0};
     std::atomic<bool> starting_{false};

@@ -47,6 +47,7 @@ private:
     ProcessState();
     ~ProcessState() override;
 
+    bool startPooledThread(bool isMain);
     // Null when it could not be opened.
     static Driver* driver();
     static const sp<ProcessState>& instance();
