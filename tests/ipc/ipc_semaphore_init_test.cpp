@@ -157,6 +157,15 @@ TEST(IpcSemaphoreInit, AsksForASharedSemaphoreOfOne) {
     EXPECT_EQ(count, 1U);
 }
 
+TEST(IpcSemaphoreInit, LeavesTheFileUnlocked) {
+    const TAVO_INT64 made = open_semaphore();
+    const int file = open(kPath, O_RDWR | O_CLOEXEC);
+    ASSERT_GE(file, 0);
+    EXPECT_EQ(flock(file, LOCK_EX | LOCK_NB), 0);
+    close(file);
+    EXPECT_EQ(tavo_semaphore_delete(made), TAVO_SUCCESS);
+}
+
 TEST(IpcSemaphoreInit, ReportsAFullDiskInsteadOfMappingIt) {
     signal(SIGXFSZ, SIG_IGN);
     rlimit before = {};

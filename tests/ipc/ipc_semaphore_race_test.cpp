@@ -21,9 +21,12 @@
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
 #include "support/process.h"
+#include "tavo_osal/thread.h"
+#include "thread/asleep.h"
 
 namespace {
 
+using tavo::test::count_descriptors;
 using tavo::test::count_of;
 using tavo::test::expect_working;
 using tavo::test::LogCapture;
@@ -31,6 +34,7 @@ using tavo::test::logged;
 using tavo::test::open_semaphore;
 using tavo::test::PlatformHook;
 using tavo::test::Process;
+using tavo::test::status_of;
 
 constexpr auto kKey = tavo::test::kSemaphoreKey;
 constexpr auto& kPath = tavo::test::kSemaphoreFile;
@@ -205,6 +209,35 @@ TEST(IpcSemaphoreRace, AnOpenerGivesACreatorUpThatStaysStopped) {
     creator.kill(SIGKILL);
     EXPECT_EQ(creator.wait(), -SIGKILL);
     expect_working(open_semaphore());
+}
+
+TEST(IpcSemaphoreRace, AThreadThatIsCancelledWhileItCreatesFinishesFirst) {
+    const size_t descriptors = count_descriptors();
+    const PlatformHook hook(
+        "libtavoosal.so", "sem_init", +[](sem_t* semaphore, int shared, unsigned value) {
+            tavo_osal_thread_cancel(pthread_self());
+            return sem_init(semaphore, shared, value);
+        });
+    static bool returned;
+    returned = false;
+    const auto create = [](void*) -> void* {
+        TAVO_INT64 handle = 0;
+        tavo_semaphore_init(kKey, &handle);
+        returned = true;
+        return nullptr;
+    };
+    pthread_t thread = {};
+    ASSERT_EQ(tavo_osal_thread_create(&thread, create, nullptr), TAVO_SUCCESS);
+    EXPECT_EQ(tavo_osal_thread_join(thread), TAVO_SUCCESS);
+    EXPECT_EQ(count_descriptors(), descriptors);
+    EXPECT_EQ(status_of(kPath).st_size, static_cast<off_t>(sizeof(sem_t)));
+    // ThreadSanitizer delivers signals late.
+    EXPECT_TRUE(!returned || tavo::test::kThreadSanitizer);
+
+    // Another process is not held up by the lock of this one, which lives.
+    Process opener = Process::start("opener");
+    EXPECT_EQ(opener.read_line(), "opening");
+    EXPECT_EQ(opener.read_line(), "1");
 }
 
 TEST(IpcSemaphoreRace, ACreatorThatIsOvertakenDoesNotInitialiseAgain) {

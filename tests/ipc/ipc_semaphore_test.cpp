@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <pthread.h>
 #include <semaphore.h>
 #include <signal.h>
 #include <sys/stat.h>
@@ -19,6 +20,8 @@
 #include "ipc/ipc_semaphore_test.h"
 #include "support/log_capture.h"
 #include "support/process.h"
+#include "tavo_osal/thread.h"
+#include "thread/asleep.h"
 
 namespace {
 
@@ -208,6 +211,31 @@ TEST(IpcSemaphore, FailsForHandlesThatAreNone) {
                                              {1, kTag, "Release failed !"},
                                              {1, kTag, "Semaphore Wait failed !"},
                                              {1, kTag, "Release failed !"}}));
+}
+
+struct Waiter {
+    const TAVO_INT64 handle;
+    tavo::test::Bedside bedside;
+};
+
+TEST(IpcSemaphore, LetsAThreadThatWaitsBeCancelled) {
+    Waiter waiter = {open_semaphore(), {}};
+    EXPECT_EQ(tavo_semaphore_acquire(waiter.handle), TAVO_SUCCESS);
+    const auto wait = [](void* opaque) -> void* {
+        auto* self = static_cast<Waiter*>(opaque);
+        self->bedside.going_to_sleep();
+        tavo_semaphore_acquire(self->handle);
+        return opaque;
+    };
+    pthread_t thread = {};
+    ASSERT_EQ(tavo_osal_thread_create(&thread, wait, &waiter), TAVO_SUCCESS);
+    waiter.bedside.wait_until_asleep();
+    EXPECT_EQ(tavo_osal_thread_cancel(thread), TAVO_SUCCESS);
+    void* result = &waiter;
+    EXPECT_EQ(pthread_join(thread, &result), 0);
+    EXPECT_EQ(result, nullptr);
+    EXPECT_EQ(tavo_semaphore_release(waiter.handle), TAVO_SUCCESS);
+    EXPECT_EQ(count_of(waiter.handle), 1);
 }
 
 }  // namespace

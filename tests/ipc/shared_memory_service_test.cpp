@@ -50,6 +50,7 @@ class FakeService : public android::BnTavoBinder {
 public:
     sp<IMemoryHeap> get_shared_mem(int key, int size) override {
         calls.push_back("get " + std::to_string(key) + " " + std::to_string(size));
+        if (meanwhile) meanwhile();
         return heap;
     }
     int delete_shared_mem(int key) override {
@@ -62,6 +63,7 @@ public:
     int delete_message_queue(int) override { return -1; }
 
     std::vector<std::string> calls;
+    std::function<void()> meanwhile;  // what happens in the process while the service is asked for a block
     sp<IMemoryHeap> heap;
     int result = 0;
 };
@@ -133,6 +135,32 @@ TEST_F(SharedMemoryService, IsNotAskedOnceTheTableIsFull) {
     EXPECT_EQ(address, kUntouched);
     EXPECT_EQ(service_->calls, Calls{});
     for (char& base : memory) EXPECT_EQ(tavo_shm_release(&base), TAVO_SUCCESS);
+}
+
+// The places that are left belong to the acquisitions that have already begun.
+TEST_F(SharedMemoryService, IsNotAskedForMoreBlocksThanThereWillBePlaces) {
+    static char memory;
+    service_->heap = new FakeHeap([] { return &memory; });
+    TavoShmHandle handle = {7, 100};
+    void* address = nullptr;
+    for (int i = 0; i < TAVO_SHM_MAX_ACQUIRED - 1; ++i) ASSERT_EQ(tavo_shm_acquire(&handle, &address), TAVO_SUCCESS);
+    TAVO_Status other = TAVO_SUCCESS;
+    service_->meanwhile = [&other] {
+        TavoShmHandle other_handle = {8, 100};
+        void* other_address = nullptr;
+        other = tavo_shm_acquire(&other_handle, &other_address);
+    };
+    EXPECT_EQ(tavo_shm_acquire(&handle, &address), TAVO_SUCCESS);
+    EXPECT_EQ(other, TAVO_NO_MEMORY);
+
+    // One that fails gives its place back.
+    service_->meanwhile = nullptr;
+    service_->heap = nullptr;
+    EXPECT_EQ(tavo_shm_release(&memory), TAVO_SUCCESS);
+    expect_failure(7, 100);
+    service_->heap = new FakeHeap([] { return &memory; });
+    EXPECT_EQ(tavo_shm_acquire(&handle, &address), TAVO_SUCCESS);
+    for (int i = 0; i < TAVO_SHM_MAX_ACQUIRED; ++i) EXPECT_EQ(tavo_shm_release(&memory), TAVO_SUCCESS);
 }
 
 TEST_F(SharedMemoryService, IsNotTouchedByARelease) {
