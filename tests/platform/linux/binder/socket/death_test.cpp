@@ -114,7 +114,8 @@ TEST(SocketDeath, CannotBeAskedForAfterwards) {
     server.kill(SIGKILL);
     server.wait();
     const sp<Recipient> recipient = new Recipient;
-    EXPECT_TRUE(eventually([&] { return service->linkToDeath(recipient) == DEAD_OBJECT; }));
+    EXPECT_EQ(service->pingBinder(), DEAD_OBJECT);  // from here on the process knows
+    EXPECT_EQ(service->linkToDeath(recipient), DEAD_OBJECT);
 }
 
 TEST(SocketDeath, LeavesTheNameToWhoComesNext) {
