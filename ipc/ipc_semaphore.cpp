@@ -112,7 +112,11 @@ public:
         fchmod(fd_, kFinishedMode);
         // Written, not just lengthened: on a full disk, a mapping of bytes that were never written would kill its
         // users.
-        if (pwrite(fd_, zeros, sizeof zeros, 0) != static_cast<ssize_t>(sizeof zeros)) return failed();
+        if (pwrite(fd_, zeros, sizeof zeros, 0) != static_cast<ssize_t>(sizeof zeros)) {
+            // A part of them would look like somebody else's file.
+            [[maybe_unused]] const int result = ftruncate(fd_, 0);
+            return failed();
+        }
         Mapping mapping(fd_);
         if (mapping.get() == MAP_FAILED) return failed();
         memset(mapping.get(), 0, sizeof(sem_t));

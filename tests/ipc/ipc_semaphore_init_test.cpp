@@ -166,16 +166,21 @@ TEST(IpcSemaphoreInit, LeavesTheFileUnlocked) {
     EXPECT_EQ(tavo_semaphore_delete(made), TAVO_SUCCESS);
 }
 
-TEST(IpcSemaphoreInit, ReportsAFullDiskInsteadOfMappingIt) {
+class FullDisk : public testing::TestWithParam<rlim_t> {};
+
+TEST_P(FullDisk, IsReportedAndTheNextCallMakesTheSemaphore) {
     signal(SIGXFSZ, SIG_IGN);
     rlimit before = {};
     ASSERT_EQ(getrlimit(RLIMIT_FSIZE, &before), 0);
-    const rlimit none = {0, before.rlim_max};
-    ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &none), 0);
+    const rlimit little = {GetParam(), before.rlim_max};
+    ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &little), 0);
     expect_failure(kMakeFailed);
     ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &before), 0);
+    EXPECT_EQ(status_of(kPath).st_size, 0);
     EXPECT_EQ(count_of(open_semaphore()), 1);
 }
+
+INSTANTIATE_TEST_SUITE_P(WithRoomFor, FullDisk, testing::Values(0, 1, sizeof(sem_t)));
 
 TEST(IpcSemaphoreInit, ReportsAFileThatCannotBeFinished) {
     {
