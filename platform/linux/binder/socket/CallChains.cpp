@@ -8,39 +8,56 @@
 
 namespace android::socket_driver {
 
-CallChains::Waiting::Waiting(CallChains& chains, uint64_t chain) : chains_(chains), chain_(chain) {
+thread_local CallChains::Waiting* CallChains::innermost_ = nullptr;
+
+CallChains::Waiting::Waiting(CallChains& chains, uint64_t chain)
+    : chains_(chains),
+      chain_(chain),
+      outer_(innermost_),
+      own_(outer_ == nullptr ? chains.takeBell() : UniqueFd()),
+      bell_(outer_ == nullptr ? own_.get() : outer_->bell_) {
+    innermost_ = this;
     const std::lock_guard<std::mutex> lock(chains_.mutex_);
-    if (!chains_.spare_.empty()) {
-        wake_ = std::move(chains_.spare_.back());
-        chains_.spare_.pop_back();
-    } else {
-        wake_.reset(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
-    }
-    if (!wake_.valid()) return;
+    if (bell_ < 0) return;
     chains_.waiting_.push_back(this);
     ++chains_.count_;
 }
 
 CallChains::Waiting::~Waiting() {
-    if (!wake_.valid()) return;
+    innermost_ = outer_;
+    if (bell_ < 0) return;
     {
         const std::lock_guard<std::mutex> lock(chains_.mutex_);
         std::vector<Waiting*>& waiting = chains_.waiting_;
         waiting.erase(std::find(waiting.begin(), waiting.end(), this));
         --chains_.count_;
         // One that has been rung is not used again: it would wake the next for nothing.
-        if (arrivals_.empty() && chains_.spare_.size() < kMaxSpare) chains_.spare_.push_back(std::move(wake_));
+        const bool isQuiet = own_.valid() && arrivals_.empty();
+        if (isQuiet && chains_.spareBells_.size() < kMaxSpare) chains_.spareBells_.push_back(std::move(own_));
     }
     for (Arrival& arrival : arrivals_) chains_.late_(std::move(arrival));
 }
 
 std::vector<Arrival> CallChains::Waiting::wait(int channel) {
-    pollfd polled[] = {{channel, POLLIN, 0}, {wake_.get(), POLLIN, 0}};
-    if (poll(polled, wake_.valid() ? 2 : 1, -1) <= 0 || polled[1].revents == 0) return {};
+    {
+        // A nested call may have heard the bell instead.
+        const std::lock_guard<std::mutex> lock(chains_.mutex_);
+        if (!arrivals_.empty()) return std::exchange(arrivals_, {});
+    }
+    pollfd polled[] = {{channel, POLLIN, 0}, {bell_, POLLIN, 0}};
+    if (poll(polled, 2, -1) <= 0 || polled[1].revents == 0) return {};
     eventfd_t rings = 0;
-    eventfd_read(wake_.get(), &rings);
+    eventfd_read(bell_, &rings);
     const std::lock_guard<std::mutex> lock(chains_.mutex_);
     return std::exchange(arrivals_, {});
+}
+
+UniqueFd CallChains::takeBell() {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    if (spareBells_.empty()) return UniqueFd(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
+    UniqueFd bell = std::move(spareBells_.back());
+    spareBells_.pop_back();
+    return bell;
 }
 
 bool CallChains::handOver(Arrival& arrival) {
@@ -52,7 +69,7 @@ bool CallChains::handOver(Arrival& arrival) {
     });
     if (found == waiting_.rend()) return false;
     (*found)->arrivals_.push_back(std::move(arrival));
-    eventfd_write((*found)->wake_.get(), 1);
+    eventfd_write((*found)->bell_, 1);
     return true;
 }
 

@@ -32,7 +32,9 @@ public:
         friend class CallChains;
         CallChains& chains_;
         const uint64_t chain_;
-        UniqueFd wake_;
+        Waiting* const outer_;  // of the same thread: the call that runs one of whose calls this is
+        UniqueFd own_;          // of the outermost
+        const int bell_;
         std::vector<Arrival> arrivals_;
     };
 
@@ -43,13 +45,16 @@ public:
     bool handOver(Arrival& arrival);
 
 private:
-    static constexpr size_t kMaxSpare = 16;
+    static constexpr size_t kMaxSpare = 4;
+    static thread_local Waiting* innermost_;
+
+    UniqueFd takeBell();
 
     const std::function<void(Arrival)> late_;
     std::atomic<size_t> count_{0};
     std::mutex mutex_;
     std::vector<Waiting*> waiting_;  // in the order of their calls
-    std::vector<UniqueFd> spare_;
+    std::vector<UniqueFd> spareBells_;
 };
 
 }  // namespace android::socket_driver

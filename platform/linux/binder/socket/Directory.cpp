@@ -49,8 +49,11 @@ status_t Directory::publish(const std::string& name, const sp<IBinder>& service)
         return status;
     }
     Publication& publication = publications_[name];
-    if (publication.service != nullptr) neighbourhood_.removeListener(publication.listener);
-    previous = std::exchange(publication, {service, listener->id, unnamed.file}).service;
+    if (publication.listener != nullptr) {
+        publication.listener->finish();
+        neighbourhood_.removeListener(publication.listener->id);
+    }
+    previous = std::exchange(publication, {service, listener, unnamed.file}).service;
     return OK;
 }
 

@@ -16,6 +16,8 @@
 
 namespace android::socket_driver {
 
+class Listener;
+
 // What the directory needs of the driver around it.
 class Neighbourhood {
 public:
@@ -53,7 +55,7 @@ public:
 private:
     struct Publication {
         sp<IBinder> service;
-        uint64_t listener;
+        std::shared_ptr<Listener> listener;
         FileId file;
     };
 

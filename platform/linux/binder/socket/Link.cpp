@@ -71,7 +71,7 @@ bool Link::addIntroduction(const std::shared_ptr<Link>& introduced) {
 void Link::onReady() {
     {
         const std::lock_guard<std::mutex> lock(mutex_);
-        if (isUnheard_) flushReleases();
+        if (isUnheard_) flushNews();
     }
     if (!readMessage()) events_.linkEnded(std::static_pointer_cast<Link>(shared_from_this()));
 }
@@ -135,8 +135,10 @@ bool Link::handleOffer(const ChannelOffer& offer, std::vector<UniqueFd>& descrip
     const auto self = std::static_pointer_cast<Link>(shared_from_this());
     if (!lost && events_.channelOffered(self, offer.purpose, std::move(descriptors.front()))) return true;
     // Without the peer's hearing of it, its call would wait for ever.
-    const ControlHeader refusal{kMagic, ControlType::kRefusal};
-    return !dead_ && sendBytes(control_.get(), &refusal, sizeof refusal, {}, MSG_DONTWAIT) >= 0;
+    const std::lock_guard<std::mutex> lock(mutex_);
+    ++refused_;
+    if (!isUnheard_) flushNews();
+    return true;
 }
 
 void Link::cut() {
@@ -266,32 +268,35 @@ bool Link::addWaiting(size_t cost) {
     return false;
 }
 
-// -- References
+// -- News for the peer
 
 void Link::releaseReferences(uint64_t node, uint64_t count) {
     const std::lock_guard<std::mutex> lock(mutex_);
     if (dead_) return;
     releases_.push_back({node, count});
-    if (!isUnheard_) flushReleases();
+    if (!isUnheard_) flushNews();
     if (releases_.size() > kMaxReleases) shutdown(control_.get(), SHUT_RDWR);
 }
 
-void Link::flushReleases() {
-    while (!releases_.empty()) {
-        ReleasePacket packet;
-        size_t count = 0;
-        while (count < std::min(releases_.size(), kReleaseBatch)) {
-            packet.references[count] = releases_[count];
-            ++count;
-        }
-        const size_t size = sizeof packet.header + count * sizeof(ReleasedReference);
-        if (sendBytes(control_.get(), &packet, size, {}, MSG_DONTWAIT) < 0) break;
-        releases_.erase(releases_.begin(), releases_.begin() + static_cast<std::ptrdiff_t>(count));
+void Link::flushNews() {
+    const ControlHeader refusal{kMagic, ControlType::kRefusal};
+    while (refused_ > 0 && sendBytes(control_.get(), &refusal, sizeof refusal, {}, MSG_DONTWAIT) >= 0) --refused_;
+    while (!releases_.empty() && sendReleases()) {
     }
-    if (isUnheard_ == releases_.empty()) {
-        isUnheard_ = !isUnheard_;
-        poller_.change(*this, Poller::kReadable | (isUnheard_ ? Poller::kWritable : 0U));
-    }
+    const bool isHeard = refused_ == 0 && releases_.empty();
+    if (isUnheard_ != isHeard) return;
+    isUnheard_ = !isHeard;
+    poller_.change(*this, Poller::kReadable | (isUnheard_ ? Poller::kWritable : 0U));
+}
+
+bool Link::sendReleases() {
+    ReleasePacket packet;
+    const size_t count = std::min(releases_.size(), kReleaseBatch);
+    std::copy_n(releases_.begin(), count, packet.references);
+    const size_t size = sizeof packet.header + count * sizeof(ReleasedReference);
+    if (sendBytes(control_.get(), &packet, size, {}, MSG_DONTWAIT) < 0) return false;
+    releases_.erase(releases_.begin(), releases_.begin() + static_cast<std::ptrdiff_t>(count));
+    return true;
 }
 
 }  // namespace android::socket_driver

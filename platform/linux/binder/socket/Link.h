@@ -123,7 +123,8 @@ private:
     bool handleOffer(const ChannelOffer& offer, std::vector<UniqueFd>& descriptors, bool lost);
     status_t makeChannel(Purpose purpose, Channel& channel);
     void returnChannel(Channel& channel);
-    void flushReleases();
+    void flushNews();
+    bool sendReleases();
 
     struct Outgoing {
         std::vector<UniqueFd> idle;
@@ -154,6 +155,7 @@ private:
     size_t refusals_ = 0;
     std::unordered_map<uint64_t, Purpose> served_;
     size_t servedCount_[kPurposes] = {};
+    size_t refused_ = 0;  // channels of the peer's, of which it is to be told
     std::deque<ReleasedReference> releases_;
     bool isUnheard_ = false;  // the peer does not take what it is told
 };

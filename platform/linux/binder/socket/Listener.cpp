@@ -22,12 +22,20 @@ Listener::Listener(UniqueFd socket, std::function<void(UniqueFd)> welcome)
     : socket_(std::move(socket)), welcome_(std::move(welcome)), spare_(anyDescriptor()) {}
 
 void Listener::onReady() {
-    UniqueFd connection(accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC));
-    if (connection.valid()) {
-        welcome_(std::move(connection));
-    } else if (errno == EMFILE || errno == ENFILE || errno == ENOMEM || errno == ENOBUFS) {
-        turnAway();
+    if (letIn()) return;
+    if (errno == EMFILE || errno == ENFILE || errno == ENOMEM || errno == ENOBUFS) turnAway();
+}
+
+void Listener::finish() {
+    for (int i = 0; i < SOMAXCONN && letIn(); ++i) {
     }
+}
+
+bool Listener::letIn() {
+    UniqueFd connection(accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC));
+    if (!connection.valid()) return false;
+    welcome_(std::move(connection));
+    return true;
 }
 
 // Without descriptors left, nobody can be let in; but nobody is to wait at the door for ever either.

@@ -14,8 +14,11 @@ public:
     int fd() const override { return socket_.get(); }
     // Lets one in, so that nobody else is kept waiting by a crowd.
     void onReady() override;
+    // Lets all in who are at the door, before it closes because the name is another's now.
+    void finish();
 
 private:
+    bool letIn();
     void turnAway();
 
     const UniqueFd socket_;

@@ -96,6 +96,18 @@ status_t TestService::onObject(uint32_t code, const Parcel& data, Parcel* reply)
         case kKept: return reply->writeStrongBinder(kept_);
         case kTakeKept: return reply->writeStrongBinder(std::exchange(kept_, nullptr));
         case kIsKept: return reply->writeInt32(data.readStrongBinder() == kept_);
+        case kIsKeptNamed: {
+            const sp<IBinder> kept = kept_;
+            mutex_.unlock();
+            const sp<IBinder> found = defaultServiceManager()->checkService(data.readString16());
+            mutex_.lock();
+            return reply->writeInt32(found == kept);
+        }
+        case kPassKept: {
+            Parcel request;
+            request.writeStrongBinder(std::exchange(kept_, nullptr));
+            return data.readStrongBinder()->transact(kKeep, request, reply);
+        }
         case kIsThis: return reply->writeInt32(data.readStrongBinder() == this);
         case kCallKept: {
             const sp<IBinder> kept = kept_;

@@ -38,6 +38,8 @@ public:
         kKept,            // -> what was kept
         kTakeKept,        // -> what was kept, which is forgotten
         kIsKept,          // binder -> whether it is what is kept
+        kIsKeptNamed,     // name -> whether what it stands for is what is kept
+        kPassKept,        // binder: has it keep what is kept here, which is forgotten
         kIsThis,          // binder -> whether it is this very object
         kCallKept,        // code, its request -> its reply
         kPingKept,        // -> the status of a ping of what is kept
