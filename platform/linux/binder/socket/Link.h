@@ -86,7 +86,8 @@ public:
     // A link that was made by an introduction lasts no longer than what came with it is in use.
     void setTemporary() { temporary_ = true; }
     bool isTemporary() const { return temporary_; }
-    // Counts a connection made for a third process to meet this one, as long as it has not. False when there are too many.
+    // Counts a connection made for a third process to meet this one, as long as it has not. False when there are too
+    // many.
     bool addIntroduction(const std::shared_ptr<Link>& introduced);
 
     bool dead() const { return dead_; }
@@ -95,8 +96,8 @@ public:
 
     // Waits for one while as many as the peer takes are in use.
     status_t takeChannel(Purpose purpose, Channel& channel);
-    // After a fresh channel was closed: waits for the peer's word on it. DEAD_OBJECT when the peer is gone, NO_MEMORY when
-    // it has no room.
+    // After a fresh channel was closed: waits for the peer's word on it. DEAD_OBJECT when the peer is gone, NO_MEMORY
+    // when it has no room.
     status_t heedRefusal();
     // For when there is no room for one more channel: waits until one can be used again. False when there is none.
     bool waitForIdle(Purpose purpose);
