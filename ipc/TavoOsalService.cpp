@@ -131,6 +131,7 @@ int TavoOsalService::create_message_queue(int key) {
 // A queue that cannot be made, for want of descriptors or memory, leaves the table as it was.
 int TavoOsalService::addQueue(int key) {
     if (m_uiQueueCount == m_uiQueueRoom) {
+        // NOLINTNEXTLINE(bugprone-sizeof-expression): an entry is a pointer
         auto** grown = static_cast<KeyRecord**>(realloc(m_ppQueues, size_t{m_uiQueueRoom} * 2 * sizeof(KeyRecord*)));
         if (grown == nullptr) return -1;
         m_ppQueues = grown;
