@@ -156,13 +156,39 @@ void Link::cut() {
 
 // -- Channels to call on
 
-status_t Link::takeChannel(Purpose purpose, Channel& channel) {
+class Link::Turn {
+public:
+    Turn(Link& link, std::deque<const Channel*>& queue, const Channel& channel)
+        : link_(link), queue_(queue), channel_(channel) {
+        queue_.push_back(&channel_);
+    }
+    ~Turn() {
+        queue_.erase(std::find(queue_.begin(), queue_.end(), &channel_));
+        link_.changed_.notify_all();
+    }
+    Turn(const Turn&) = delete;
+    Turn& operator=(const Turn&) = delete;
+
+private:
+    Link& link_;
+    std::deque<const Channel*>& queue_;
+    const Channel& channel_;
+};
+
+status_t Link::takeChannel(Purpose purpose, bool mayBeFresh, Channel& channel) {
     {
         std::unique_lock<std::mutex> lock(mutex_);
         Outgoing& channels = outgoing(purpose);
         const size_t most = purpose == Purpose::kDirectory ? kMaxDirectoryChannels : maxChannels_;
-        changed_.wait(lock, [&] { return dead_ || !channels.idle.empty() || channels.open < most; });
+        const auto isOver = [&] {
+            return !channels.idle.empty() || (mayBeFresh ? channels.open < most : channels.open == 0);
+        };
+        if (!channels.waiting.empty() || !isOver()) {
+            const Turn turn(*this, channels.waiting, channel);
+            changed_.wait(lock, [&] { return dead_ || (channels.waiting.front() == &channel && isOver()); });
+        }
         if (dead_) return DEAD_OBJECT;
+        if (channels.idle.empty() && !mayBeFresh) return NO_MEMORY;
         channel.purpose_ = purpose;
         if (channels.idle.empty()) {
             ++channels.open;
@@ -214,13 +240,6 @@ status_t Link::heedRefusal() {
     if (refusals_ == 0) return DEAD_OBJECT;
     --refusals_;
     return NO_MEMORY;
-}
-
-bool Link::waitForIdle(Purpose purpose) {
-    std::unique_lock<std::mutex> lock(mutex_);
-    Outgoing& channels = outgoing(purpose);
-    changed_.wait(lock, [&] { return dead_ || !channels.idle.empty() || channels.open == 0; });
-    return !channels.idle.empty();
 }
 
 // -- Channels to serve

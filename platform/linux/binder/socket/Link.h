@@ -94,13 +94,13 @@ public:
     // Calls that wait on this link fail, and no new one starts. The end itself is reported by the poller.
     void cut();
 
-    // Waits for one while as many as the peer takes are in use.
-    status_t takeChannel(Purpose purpose, Channel& channel);
+    // Waits for its turn while as many as the peer takes are in use. One that is not to be `fresh` was in use before,
+    // by this process's word for it or the peer's there is no room for more. DEAD_OBJECT when the peer is gone,
+    // NO_MEMORY when there is none to be had.
+    status_t takeChannel(Purpose purpose, bool mayBeFresh, Channel& channel);
     // After a fresh channel was closed: waits for the peer's word on it. DEAD_OBJECT when the peer is gone, NO_MEMORY
     // when it has no room.
     status_t heedRefusal();
-    // For when there is no room for one more channel: waits until one can be used again. False when there is none.
-    bool waitForIdle(Purpose purpose);
 
     // Channels that the peer calls on, by their number at the poller.
     bool addServed(uint64_t channel, Purpose purpose);
@@ -129,8 +129,11 @@ private:
 
     struct Outgoing {
         std::vector<UniqueFd> idle;
-        size_t open = 0;  // idle ones and those in use
+        size_t open = 0;                     // idle ones and those in use
+        std::deque<const Channel*> waiting;  // in the order of their coming
     };
+    // A place in the queue for a channel.
+    class Turn;
     Outgoing& outgoing(Purpose purpose) { return outgoing_[static_cast<size_t>(purpose)]; }
 
     LinkEvents& events_;

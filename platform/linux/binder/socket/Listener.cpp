@@ -41,8 +41,9 @@ bool Listener::letIn() {
 // Without descriptors left, nobody can be let in; but nobody is to wait at the door for ever either.
 void Listener::turnAway() {
     spare_.reset();
-    const UniqueFd connection(accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC));
+    UniqueFd connection(accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC));
     if (!connection.valid()) std::this_thread::sleep_for(kPause);
+    connection.reset();
     spare_ = anyDescriptor();
 }
 

@@ -63,27 +63,29 @@ status_t SocketDriver::call(const References::Route& route, Purpose purpose, uin
 
 status_t SocketDriver::callOnChannel(const std::shared_ptr<Link>& link, Purpose purpose, OutgoingParcel& out,
                                      Parcel* reply) {
-    for (;;) {
-        status_t status = OK;
+    status_t status = OK;
+    for (bool mayBeFresh = true;; mayBeFresh = false) {
+        bool isRefused = false;
         {
             Link::Channel channel;
-            status = link->takeChannel(purpose, channel);
+            status = link->takeChannel(purpose, mayBeFresh, channel);
             if (status == OK) {
                 const Outcome outcome = exchange(link, channel.fd(), purpose, out, reply, status);
                 if (outcome == Outcome::kAnswered) {
                     channel.endInOrder();
                     return status;
                 }
-                status = outcome == Outcome::kUnheard && channel.isFresh() ? NO_INIT : DEAD_OBJECT;
+                isRefused = outcome == Outcome::kUnheard && channel.isFresh();
+                status = DEAD_OBJECT;
             }
         }
-        // Where it is not that the peer had no room for the channel, the peer is gone.
-        if (status == NO_INIT) status = link->heedRefusal();
-        if (status == NO_MEMORY && link->waitForIdle(purpose)) continue;
-        translator_.takeBack(*link, out);
-        if (status == DEAD_OBJECT) link->cut();
-        return status == DEAD_OBJECT || link->dead() ? DEAD_OBJECT : FAILED_TRANSACTION;
+        if (isRefused) status = link->heedRefusal();
+        if (status != NO_MEMORY || !mayBeFresh) break;
     }
+    translator_.takeBack(*link, out);
+    if (status != DEAD_OBJECT) return FAILED_TRANSACTION;
+    link->cut();
+    return DEAD_OBJECT;
 }
 
 // The transaction that this thread runs for the link's peer, whose own thread waits for it and can serve in turn.

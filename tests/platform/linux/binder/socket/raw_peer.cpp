@@ -5,6 +5,8 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <atomic>
+#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -134,6 +136,15 @@ ReceivedFrame receive_frame(int socket) {
     return frame;
 }
 
+uint64_t object_in(const ReceivedFrame& frame) {
+    if (frame.header.objectCount == 0) return 0;
+    uint64_t offset = 0;
+    memcpy(&offset, frame.data.data() + wire::padded(frame.header.dataSize), sizeof offset);
+    flat_binder_object object;
+    memcpy(&object, frame.data.data() + offset, sizeof object);
+    return object.binder;
+}
+
 UniqueFd receive_descriptor(int socket) {
     char buffer[256];
     std::vector<UniqueFd> descriptors;
@@ -191,15 +202,13 @@ uint64_t RawPeer::look_up(const std::string& name) const {
     data.resize((data.size() + 2 + 3) & ~size_t{3});
     send_raw(channel.get(), transaction(wire::kDirectoryNode, wire::kLookUp, data).bytes());
     const ReceivedFrame reply = receive_frame(channel.get());
-    if (!reply.is(wire::FrameType::kReply) || reply.header.objectCount != 1) return 0;
-    flat_binder_object object;
-    memcpy(&object, reply.data.data(), sizeof object);
-    return object.binder;
+    return reply.is(wire::FrameType::kReply) ? object_in(reply) : 0;
 }
 
 UniqueFd listen_raw(const std::string& name) {
     UniqueFd listener(::socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0));
     const sockaddr_un address = address_of(name);
+    unlink(address.sun_path);
     if (bind(listener.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) perror("bind");
     if (listen(listener.get(), 16) != 0) perror("listen");
     return listener;
@@ -209,7 +218,9 @@ UniqueFd accept_raw(int listener, bool greets) {
     UniqueFd connection(accept4(listener, nullptr, nullptr, SOCK_CLOEXEC));
     wire::Greeting welcome{};
     welcome.header = {wire::kMagic, wire::ControlType::kWelcome};
-    welcome.instance = 2;
+    // Each stands for another process.
+    static std::atomic<uint64_t> instance{2};
+    welcome.instance = ++instance;
     welcome.maxChannels = 16;
     if (greets) send_raw(connection.get(), bytes_of(welcome));
     return connection;

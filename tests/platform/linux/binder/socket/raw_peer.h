@@ -53,6 +53,8 @@ struct ReceivedFrame {
     int32_t status() const { return static_cast<int32_t>(header.code); }
 };
 ReceivedFrame receive_frame(int socket);
+// What the first object in a frame stands for; 0 when there is none.
+uint64_t object_in(const ReceivedFrame& frame);
 
 // The descriptor that comes with the next message.
 android::UniqueFd receive_descriptor(int socket);
