@@ -74,7 +74,11 @@ TEST_ROLE(exhausted_server) {
         std::vector<int> taken;
         if (getchar() == EOF) return 0;
         getchar();
-        for (int fd = 0; (fd = open("/dev/null", O_RDONLY | O_CLOEXEC)) >= 0;) taken.push_back(fd);
+        // What earlier clients leave behind is given back a little later.
+        for (int i = 0; i < 2; ++i) {
+            for (int fd = 0; (fd = open("/dev/null", O_RDONLY | O_CLOEXEC)) >= 0;) taken.push_back(fd);
+            std::this_thread::sleep_for(std::chrono::milliseconds(200));
+        }
         puts("exhausted");
         getchar();
         getchar();
@@ -129,19 +133,26 @@ TEST(SocketProcess, WithoutDescriptorsTurnsNewcomersAwayAndServesTheOthers) {
 TEST(SocketProcess, WithoutDescriptorsGoesOnCalling) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
-    ASSERT_EQ(service->pingBinder(), OK);
+    const auto call_from_many_threads = [&] {
+        std::vector<std::thread> callers;
+        for (int i = 0; i < 8; ++i) {
+            callers.emplace_back([&] {
+                for (int n = 0; n < 20; ++n) EXPECT_EQ(service->pingBinder(), OK);
+            });
+        }
+        for (std::thread& caller : callers) caller.join();
+    };
+    // Once before: a sanitizer takes descriptors where it meets a type for the first time.
+    call_from_many_threads();
+    Parcel reply;
+    EXPECT_EQ(service->transact(TestService::kOpenPipe, Parcel(), &reply), OK);
+    reply.freeData();
+
+    std::vector<int> taken;
     const rlimit few{static_cast<rlim_t>(count_descriptors() + 3), 20000};
     ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &few), 0);
-    std::vector<int> taken;
     for (int fd = 0; (fd = open("/dev/null", O_RDONLY | O_CLOEXEC)) >= 0;) taken.push_back(fd);
-    std::vector<std::thread> callers;
-    for (int i = 0; i < 8; ++i) {
-        callers.emplace_back([&] {
-            for (int n = 0; n < 20; ++n) EXPECT_EQ(service->pingBinder(), OK);
-        });
-    }
-    for (std::thread& caller : callers) caller.join();
-    Parcel reply;
+    call_from_many_threads();
     EXPECT_EQ(service->transact(TestService::kOpenPipe, Parcel(), &reply), FAILED_TRANSACTION)
         << "there is no room for what it sends";
     for (const int fd : taken) close(fd);
@@ -275,7 +286,7 @@ TEST(SocketProcess, IsNotDisturbedByAForkedCopyThatExits) {
         const auto start = steady_clock::now();
         ASSERT_EQ(waitpid(child, &status, 0), child);
         EXPECT_EQ(status, 0);
-        EXPECT_LT(steady_clock::now() - start, std::chrono::seconds(1));
+        EXPECT_LT(steady_clock::now() - start, std::chrono::milliseconds(kSanitized ? 4000 : 900));
         EXPECT_EQ(service->pingBinder(), OK);
         EXPECT_EQ(ask(service, TestService::kPingKept), OK);
     }
