@@ -129,6 +129,13 @@ void Process::kill(int signal) {
     if (pid_ > 0) ::kill(pid_, signal);
 }
 
+void Process::stop() {
+    kill(SIGSTOP);
+    siginfo_t stopped{};
+    while (waitid(P_PID, static_cast<id_t>(pid_), &stopped, WSTOPPED | WEXITED | WNOWAIT) != 0 && errno == EINTR) {
+    }
+}
+
 int Process::wait() {
     int status = 0;
     pid_t result = -1;

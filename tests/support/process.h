@@ -36,6 +36,8 @@ public:
     // One line for the process's standard input.
     void write_line(const std::string& line);
     void kill(int signal);
+    // Returns once none of its threads runs; only a signal that ends it or SIGCONT does something to it then.
+    void stop();
     // Waits for the end: the exit status, or minus the signal that ended it.
     int wait();
 

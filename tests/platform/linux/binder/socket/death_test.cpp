@@ -45,7 +45,7 @@ TEST(SocketDeath, EndsTheCallsOfAKilledServer) {
 TEST(SocketDeath, EndsACallThatIsNotReadYet) {
     Process server = start_server();
     const sp<IBinder> service = find_service();
-    server.kill(SIGSTOP);
+    server.stop();
     std::thread caller([&] { EXPECT_EQ(service->pingBinder(), DEAD_OBJECT); });
     std::thread large([&] {
         Parcel data;
