@@ -1,6 +1,9 @@
 /**
  * @file
  * The whole C API. Include this, or the header of the family you need.
+ *
+ * Where a header says "/sdcard", it is the shared storage of a device, and on Linux the directory that the library was
+ * built for (TAVO_STORAGE_ROOT). It must exist.
  */
 #ifndef TAVO_OSAL_H
 #define TAVO_OSAL_H

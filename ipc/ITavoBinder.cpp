@@ -44,14 +44,14 @@ void request(IBinder* service, uint32_t code, Parcel* reply, int key, const int*
     }
 }
 
-int requestInt(IBinder* service, uint32_t code, int key) {
+int request_int(IBinder* service, uint32_t code, int key) {
     Parcel reply;
     request(service, code, &reply, key);
     return reply.readInt32();
 }
 
 // The reply closes its own descriptor, so the caller gets a duplicate.
-int requestDescriptor(IBinder* service, uint32_t code, int key) {
+int request_descriptor(IBinder* service, uint32_t code, int key) {
     Parcel reply;
     request(service, code, &reply, key);
     return fcntl(reply.readFileDescriptor(), F_DUPFD_CLOEXEC, kLowestDescriptor);
@@ -78,13 +78,13 @@ sp<ITavoBinder> ITavoBinder::asInterface(const sp<IBinder>& obj) {
 BpTavoBinder::BpTavoBinder(const sp<IBinder>& impl) : BpInterface<ITavoBinder>(impl) {}
 BpTavoBinder::~BpTavoBinder() = default;
 
-int BpTavoBinder::get_fd(int key) { return requestDescriptor(remote(), kGetFd, key); }
+int BpTavoBinder::get_fd(int key) { return request_descriptor(remote(), kGetFd, key); }
 
-int BpTavoBinder::get_write_fd(int key) { return requestDescriptor(remote(), kGetWriteFd, key); }
+int BpTavoBinder::get_write_fd(int key) { return request_descriptor(remote(), kGetWriteFd, key); }
 
-int BpTavoBinder::create_message_queue(int key) { return requestInt(remote(), kCreateMessageQueue, key); }
+int BpTavoBinder::create_message_queue(int key) { return request_int(remote(), kCreateMessageQueue, key); }
 
-int BpTavoBinder::delete_message_queue(int key) { return requestInt(remote(), kDeleteMessageQueue, key); }
+int BpTavoBinder::delete_message_queue(int key) { return request_int(remote(), kDeleteMessageQueue, key); }
 
 sp<IMemoryHeap> BpTavoBinder::get_shared_mem(int key, int size) {
     Parcel reply;
@@ -96,7 +96,7 @@ sp<IMemoryHeap> BpTavoBinder::get_shared_mem(int key, int size) {
     }
 }
 
-int BpTavoBinder::delete_shared_mem(int key) { return requestInt(remote(), kDeleteSharedMem, key); }
+int BpTavoBinder::delete_shared_mem(int key) { return request_int(remote(), kDeleteSharedMem, key); }
 
 status_t BnTavoBinder::onTransact(uint32_t code, const Parcel& data, Parcel* reply, uint32_t flags) {
     TAVO_LOG(kTag, TAVO_LOG_TRACE, "++Entered\n");

@@ -20,9 +20,9 @@ namespace {
 constexpr char kTag[] = "MSGQUEUE_BINDER";
 constexpr char kKeyIndexFile[] = TAVO_STORAGE_ROOT "/shm_key_index_file.txt";
 
-// Sets the file back to one 32-bit 1. False when it could not be opened. itemsLeft is what a read behind that
+// Sets the file back to one 32-bit 1. False when it could not be opened. items_left is what a read behind that
 // number finds, which is nothing.
-bool resetKeyIndexFile(int& itemsLeft) {
+bool reset_key_index_file(int& items_left) {
     FILE* file = fopen(kKeyIndexFile, "w+e");
     TAVO_LOG(kTag, TAVO_LOG_INFO, "Opening file in write mode, fp = %p.\n", static_cast<void*>(file));
     if (file == nullptr) {
@@ -30,17 +30,17 @@ bool resetKeyIndexFile(int& itemsLeft) {
         return false;
     }
     int32_t index = 0;
-    itemsLeft = static_cast<int>(fread(&index, sizeof index, 1, file));
-    TAVO_LOG(kTag, TAVO_LOG_INFO, "After reading, iRet = %d, index = %d.\n", itemsLeft, index);
-    if (itemsLeft == 0) {
+    items_left = static_cast<int>(fread(&index, sizeof index, 1, file));
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "After reading, iRet = %d, index = %d.\n", items_left, index);
+    if (items_left == 0) {
         index = 1;
         fseek(file, 0, SEEK_SET);  // between a read and a write, as C wants it
         fwrite(&index, sizeof index, 1, file);
     }
     fseek(file, 0, SEEK_CUR);
-    itemsLeft = static_cast<int>(fread(&index, sizeof index, 1, file));
+    items_left = static_cast<int>(fread(&index, sizeof index, 1, file));
     fseek(file, 0, SEEK_SET);
-    TAVO_LOG(kTag, TAVO_LOG_INFO, "After reading, iRet = %d, index = %d.\n", itemsLeft, index);
+    TAVO_LOG(kTag, TAVO_LOG_INFO, "After reading, iRet = %d, index = %d.\n", items_left, index);
     fclose(file);
     return true;
 }
@@ -68,15 +68,15 @@ int TavoOsalService::TavoOsalServiceInit(unsigned int uiMaxNumMsgQueues, unsigne
         TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
         return status;
     }
-    int itemsLeft = 0;
-    if (!resetKeyIndexFile(itemsLeft)) {
+    int items_left = 0;
+    if (!reset_key_index_file(items_left)) {
         // Without the file there is no queue table, and the caller is not told. Callers depend on the 0.
         TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
         return TAVO_SUCCESS;
     }
     // Deliberately as much as whole records would take, although an entry is one pointer.
     size_t bytes = 0;
-    if (!__builtin_mul_overflow(uiMaxNumMsgQueues, sizeof(KeyRecord), &bytes)) {
+    if (!__builtin_mul_overflow(size_t{uiMaxNumMsgQueues}, sizeof(KeyRecord), &bytes)) {
         m_ppQueues = static_cast<KeyRecord**>(malloc(bytes));
     }
     if (m_ppQueues == nullptr) {
@@ -87,7 +87,7 @@ int TavoOsalService::TavoOsalServiceInit(unsigned int uiMaxNumMsgQueues, unsigne
     m_uiQueueCount = 0;
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Service class created\n");
     TAVO_LOG(kTag, TAVO_LOG_TRACE, "--Exiting\n");
-    return itemsLeft;
+    return items_left;
 }
 
 int TavoOsalService::TavoOsalServiceDeInit() {
@@ -131,6 +131,7 @@ int TavoOsalService::create_message_queue(int key) {
 // A queue that cannot be made, for want of descriptors or memory, leaves the table as it was.
 int TavoOsalService::addQueue(int key) {
     if (m_uiQueueCount == m_uiQueueRoom) {
+        // NOLINTNEXTLINE(bugprone-sizeof-expression): an entry is a pointer
         auto** grown = static_cast<KeyRecord**>(realloc(m_ppQueues, size_t{m_uiQueueRoom} * 2 * sizeof(KeyRecord*)));
         if (grown == nullptr) return -1;
         m_ppQueues = grown;

@@ -60,14 +60,14 @@ private:
 
 HeapTable g_heaps;
 
-void logHeapCount(const char* change) {
+void log_heap_count(const char* change) {
     TAVO_LOG(kCountTag, TAVO_LOG_INFO, "uiCnt%s = %lu pid = %lu \n", change,
              static_cast<unsigned long>(g_heaps.count()), static_cast<unsigned long>(getpid()));
 }
 
 // A new heap, entered in the table, in a holder of its own. Null when there is no memory for any of it; whether the
 // heap could be mapped is not looked at.
-std::unique_ptr<sp<IMemoryHeap>> makeHeap(int size, const char* name) {
+std::unique_ptr<sp<IMemoryHeap>> make_heap(int size, const char* name) {
     try {
         const sp<IMemoryHeap> heap = new MemoryHeapBase(static_cast<size_t>(size), 0, name);
         auto holder = std::make_unique<sp<IMemoryHeap>>(heap);
@@ -79,13 +79,13 @@ std::unique_ptr<sp<IMemoryHeap>> makeHeap(int size, const char* name) {
 }
 
 // Takes a heap out of the table and says what it held.
-sp<IMemoryHeap> forgetHeap(const void* base) {
+sp<IMemoryHeap> forget_heap(const void* base) {
     uint32_t first_word = 0;
     if (base != MAP_FAILED) memcpy(&first_word, base, sizeof first_word);
     TAVO_LOG(kTag, TAVO_LOG_INFO, "Memory value returned = %p.\n", base);
     TAVO_LOG(kTag, TAVO_LOG_INFO, "base=%p Data=0x%x\n", base, first_word);
     sp<IMemoryHeap> heap = g_heaps.remove(base);
-    logHeapCount("--");
+    log_heap_count("--");
     return heap;
 }
 
@@ -166,7 +166,7 @@ sp<IMemoryHeap> TavoOsalService::addBlock(int key, int size) {
     char name[64];
     snprintf(name, sizeof name, "SharedMemory_%d\n", key);  // the newline is part of the name, and kept
     auto* record = static_cast<KeyRecord*>(calloc(1, sizeof(KeyRecord)));
-    auto holder = record != nullptr ? makeHeap(size, name) : nullptr;
+    auto holder = record != nullptr ? make_heap(size, name) : nullptr;
     if (holder == nullptr) {
         free(record);
         return nullptr;
@@ -178,7 +178,7 @@ sp<IMemoryHeap> TavoOsalService::addBlock(int key, int size) {
     tavo_osal_add_to_queue(&record->stLink, m_pBlocks->pHead);
     ++m_pBlocks->uiCount;
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "New node added %p.\n", static_cast<void*>(record));
-    logHeapCount("++");
+    log_heap_count("++");
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Shared Memory name = %s\n", name);
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Exiting\n");
     return *holderOf(record);
@@ -211,7 +211,7 @@ int TavoOsalService::delete_shared_mem(int key) {
     }
     heap = *holder;
     delete holder;
-    last = forgetHeap(heap->getBase());
+    last = forget_heap(heap->getBase());
 
     tavo_osal_list_delete(&record->stLink);
     free(record);

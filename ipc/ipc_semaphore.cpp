@@ -1,3 +1,5 @@
+// Built without exceptions, like thread/cancellation.cpp and for its reasons.
+//
 // A semaphore's file has sizeof(sem_t) bytes from the moment that the semaphore in it is initialised, and never
 // before: the length is what tells a finished file. Until then it has none, or one byte more. Whoever finds such a file
 // makes the semaphore, under the file's lock, whether it created the file or the creator was killed.
@@ -17,7 +19,12 @@
 #include <thread>
 #include <utility>
 
+#include "log/cancel_shield.h"
 #include "log/module_log.h"
+
+#ifdef __EXCEPTIONS
+#error "build this file with -fno-exceptions"
+#endif
 
 namespace {
 
@@ -105,7 +112,11 @@ public:
         fchmod(fd_, kFinishedMode);
         // Written, not just lengthened: on a full disk, a mapping of bytes that were never written would kill its
         // users.
-        if (pwrite(fd_, zeros, sizeof zeros, 0) != static_cast<ssize_t>(sizeof zeros)) return failed();
+        if (pwrite(fd_, zeros, sizeof zeros, 0) != static_cast<ssize_t>(sizeof zeros)) {
+            // A part of them would look like somebody else's file.
+            [[maybe_unused]] const int result = ftruncate(fd_, 0);
+            return failed();
+        }
         Mapping mapping(fd_);
         if (mapping.get() == MAP_FAILED) return failed();
         memset(mapping.get(), 0, sizeof(sem_t));
@@ -141,6 +152,8 @@ bool is_semaphore(TAVO_INT64 handle) { return static_cast<uint64_t>(handle) + 1 
 TAVO_Status tavo_semaphore_key_create(void) { return TAVO_SUCCESS; }
 
 TAVO_Status tavo_semaphore_init(uint32_t uiKey, TAVO_INT64* piSem) {
+    // A cancelled thread finishes the file first: nobody can release its lock while the process lives.
+    const tavo::CancelShield shield;
     TAVO_LOG(kTag, TAVO_LOG_TRACE, "++Entered\n");
     if (piSem == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "Invalid parameter\n");

@@ -8,6 +8,7 @@
 #include <array>
 #include <cstdlib>
 #include <mutex>
+#include <new>
 #include <utility>
 
 #include "ipc/service_lookup.h"
@@ -103,12 +104,22 @@ android::sp<android::ITavoBinder> find_service() {
 // Keys and sizes above the largest signed number arrive at the service as negative ones.
 int as_signed(uint32_t value) { return static_cast<int>(value); }
 
+// Where a heap is mapped here; null when it cannot be, for want of memory or otherwise.
+void* base_of(const android::IMemoryHeap& heap) {
+    try {
+        void* base = heap.getBase();
+        return base != MAP_FAILED ? base : nullptr;
+    } catch (const std::bad_alloc&) {
+        return nullptr;
+    }
+}
+
 // The service's block for a handle, with its address here; null when there is none.
 Heap get_mapped(android::ITavoBinder& service, const TavoShmHandle& handle, void*& base) {
     Heap heap = service.get_shared_mem(as_signed(handle.uiKey), as_signed(handle.uiSize));
     if (heap == nullptr) return nullptr;
-    base = heap->getBase();
-    if (base != MAP_FAILED && base != nullptr) return heap;
+    base = base_of(*heap);
+    if (base != nullptr) return heap;
     // The service has counted a use that nobody is going to delete.
     service.delete_shared_mem(as_signed(handle.uiKey));
     return nullptr;

@@ -170,6 +170,8 @@ void tavo_print_log(uint32_t uiLevel, uint32_t uiModule, int iLine, const TAVO_C
 }
 
 void tavo_set_log_preference(const TAVO_CHAR* pcLogPreference, TAVO_LogCallback fpCallback, void* pvParam) {
+    // As in the writer; the allocator has a lock, too.
+    const tavo::CancelShield shield;
     // Of several threads that find LOG_PREF at once, the one that sets the latch takes its value: it is split in
     // place, which two threads must not do to one string.
     char* preference = nullptr;

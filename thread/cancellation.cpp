@@ -54,7 +54,7 @@ struct Cleanup {
 };
 
 void clean_up(void* opaque) {
-    announce_once();
+    if (cancel_state.pending != 0) announce_once();  // and not for the platform's own pthread_cancel()
     const auto* cleanup = static_cast<const Cleanup*>(opaque);
     cleanup->release(cleanup->context);
 }

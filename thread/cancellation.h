@@ -1,8 +1,6 @@
 // The cancellation signal, and waits that it ends.
 #pragma once
 
-#include <type_traits>
-
 namespace tavo {
 
 // Installs the handler that ends the thread it runs on. A failure is printed on standard output and standard error.

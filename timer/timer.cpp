@@ -23,12 +23,12 @@ TAVO_Status with_mutex(TAVO_TimerFramework& framework, Operation operation, int 
     const CancelShield shield;
     TAVO_Status status = tavo_osal_mutex_lock(framework.mutex);
     if (status != TAVO_SUCCESS) {
-        tavo_print_log(TAVO_LOG_ERROR, 0, line, kTag, "Mutex lock failed \n");
+        TAVO_LOG_AT(line, kTag, TAVO_LOG_ERROR, "Mutex lock failed \n");
         return status;
     }
     operation();
     status = tavo_osal_mutex_unlock(framework.mutex);
-    if (status != TAVO_SUCCESS) tavo_print_log(TAVO_LOG_ERROR, 0, line, kTag, "Mutex unlock failed \n");
+    if (status != TAVO_SUCCESS) TAVO_LOG_AT(line, kTag, TAVO_LOG_ERROR, "Mutex unlock failed \n");
     return status;
 }
 

@@ -5,7 +5,10 @@
 #include <cstdint>
 #include <cstdio>
 
+#include "log/cancel_shield.h"
 #include "log/module_log.h"
+
+using tavo::CancelShield;
 
 namespace {
 
@@ -37,7 +40,10 @@ struct HandleText {
 
 }  // namespace
 
+// The shields: a thread that ended within the loader would keep its locks from the rest of the process.
+
 TAVO_Status tavo_osal_dlopen(const char* pcFileName, int iFlags, void** ppvHandle) {
+    const CancelShield shield;
     if (pcFileName == nullptr || ppvHandle == nullptr) return null_arguments();
     void* handle = dlopen(pcFileName, iFlags);
     if (handle == nullptr) return failed(TAVO_DL_OPEN_FAILED, "Failed to open ", pcFileName, dlerror());
@@ -47,6 +53,7 @@ TAVO_Status tavo_osal_dlopen(const char* pcFileName, int iFlags, void** ppvHandl
 }
 
 TAVO_Status tavo_osal_dlsym(void* pvHandle, const char* pcSymbol, void** ppvAddress) {
+    const CancelShield shield;
     if (pvHandle == nullptr || pcSymbol == nullptr || ppvAddress == nullptr) return null_arguments();
     // A symbol's value may be null, so only an error that was not there before tells of a failure.
     dlerror();
@@ -57,6 +64,7 @@ TAVO_Status tavo_osal_dlsym(void* pvHandle, const char* pcSymbol, void** ppvAddr
 }
 
 TAVO_Status tavo_osal_dlclose(void* pvHandle) {
+    const CancelShield shield;
     if (pvHandle == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "NULL argument passed \n");
         return TAVO_INVALID_PARAM;

@@ -12,6 +12,7 @@
 #include <cstdlib>
 #include <memory>
 
+#include "log/cancel_shield.h"
 #include "log/module_log.h"
 #include "tavo_osal/memory.h"
 
@@ -98,6 +99,8 @@ int invalid_parameter(int line = __builtin_LINE()) {
 }  // namespace
 
 TAVO_Status tavo_osal_exec(const char* pcPath, ...) {
+    // A thread that ended in here would leave the allocator's lock or the argument vector behind.
+    const tavo::CancelShield shield;
     // The line is part of the behaviour. Flushed, so that no child has a copy of the buffer to print again.
     printf("Here is %d\n", 83);
     fflush(stdout);

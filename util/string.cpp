@@ -11,6 +11,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "log/cancel_shield.h"
 #include "log/module_log.h"
 
 namespace {
@@ -37,6 +38,12 @@ int compare(const char* a, const char* b, Compare compare_texts, int line = __bu
     }
     TAVO_LOG_AT(line, kTag, TAVO_LOG_ERROR, "Invalid parameter\n");
     return a != nullptr ? static_cast<unsigned char>(*a) : -static_cast<unsigned char>(*b);
+}
+
+// strdup(); a thread that ended within the allocator would keep its lock from the rest of the process.
+char* duplicate(const char* text) {
+    const tavo::CancelShield shield;
+    return strdup(text);
 }
 
 // strtol() as where long has 32 bits.
@@ -70,7 +77,7 @@ char* tavo_osal_string_num_concatenate(char* pcDst, const char* pcSrc, unsigned 
 }
 
 char* tavo_osal_string_duplicate_string(char* pcStr) {
-    return when_given(pcStr, [=] { return strdup(pcStr); });
+    return when_given(pcStr, [=] { return duplicate(pcStr); });
 }
 
 unsigned int tavo_osal_string_get_length(const char* pcStr) {
@@ -109,7 +116,7 @@ int tavo_osal_case_ignore_string_num_compare(const char* pcA, const char* pcB, u
 }
 
 char* tavo_osal_convert_string_to_upper(const char* pcStr) {
-    char* copy = strdup(pcStr);
+    char* copy = duplicate(pcStr);
     if (copy == nullptr) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "String duplication failed\n");
         return nullptr;

@@ -11,6 +11,7 @@ pids=()
 trap 'kill "${pids[@]}" 2>/dev/null || true' EXIT
 
 start() { # ROLE: starts it with its output and its log in files of their own
+    : >"$output/$1.out"
     "$programs/demo_$1" >"$output/$1.out" 2>"$output/$1.log" &
     pids+=($!)
 }
@@ -18,6 +19,7 @@ start() { # ROLE: starts it with its output and its log in files of their own
 wait_for() { # ROLE LINE
     for _ in $(seq 200); do
         grep -qx "$2" "$output/$1.out" && return 0
+        kill -0 "${pids[-1]}" 2>/dev/null || break
         sleep 0.05
     done
     echo "the $1 did not get as far as '$2'; its log:" >&2
@@ -62,11 +64,14 @@ wait "$producer" || status=$?
 say consumer "$(grep '^saw' "$output/consumer.out" || echo 'did not finish'), and said so through queue 8"
 say producer "$(grep '^wrote' "$output/producer.out" || echo 'did not finish')"
 
+echo
+echo "What they logged at levels 1 to 3 (ordinary steps are marked E, too: the interface has them so):"
 for role in server receiver sender producer consumer; do
-    echo
-    echo "What the $role logged at levels 1 to 3:"
-    sed -n 's/^\(..*\)/  \1/p' "$output/$role.log"
+    grep . "$output/$role.log" | sed -n "1,8s/^/  /p" >"$output/$role.shown"
+    printf '  -- %s, %s lines, the first of them\n' "$role" "$(grep -c . "$output/$role.log")"
+    cat "$output/$role.shown"
 done
+echo "All of it is in $output."
 echo
 if [[ $status -ne 0 ]]; then
     echo "Messages or blocks were lost or damaged: see $output" >&2

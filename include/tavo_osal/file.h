@@ -51,7 +51,8 @@ TAVO_API int tavo_osal_file_check_existence(const char* pcPath);
 /**
  * Opens a file for reading to find its end. A path that cannot be opened without waiting, such as a pipe's that has
  * no writer, makes this wait, too.
- * @return the size in bytes; -1, logged, when the path is null, the file cannot be opened, or has no position
+ * @return the size in bytes; -1, logged, when the path is null, the file cannot be opened, or has no position; what
+ *         ftell() answered, logged, when that is negative, as for sizes beyond a long's range
  */
 TAVO_API TAVO_INT64 tavo_osal_get_file_size(const char* pcPath);
 

@@ -11,8 +11,9 @@
  * before that. A process that was killed while making it leaves a file that the next one finishes. One that
  * was stopped while making it is waited for, five seconds at most.
  *
- * No locks are taken beyond that, and nothing is kept. Every function may be called from any thread. Processes that
- * share a semaphore must be of the same word size.
+ * No locks are taken beyond that, and nothing is kept. Every function may be called from any thread. A thread that is
+ * cancelled ends at once while it waits in tavo_semaphore_acquire(), and after a tavo_semaphore_init() that it is in.
+ * Processes that share a semaphore must be of the same word size.
  */
 #ifndef TAVO_OSAL_IPC_SEMAPHORE_H
 #define TAVO_OSAL_IPC_SEMAPHORE_H

@@ -92,19 +92,23 @@ TAVO_API void tavo_print_log(uint32_t uiLevel, uint32_t uiModule, int iLine, con
  * Sets the logging globals from a preference string, or from the environment variable LOG_PREF.
  *
  * LOG_PREF wins over the argument and is consumed once: the first call that finds it applies it and
- * every later call changes nothing. Progress is printed on standard output.
+ * every later call changes nothing. Its value is split in place, so getenv() finds the first token afterwards.
+ * Progress is printed on standard output.
  *
  * The string is split at blanks and applied from left to right:
  *
- * | token      | effect                                                                            |
- * |------------|-----------------------------------------------------------------------------------|
- * | -s, -f, -c | stream 1, 2 or 3; -c also records the callback and its parameter                  |
- * | -a         | enables every module                                                              |
- * | -t         | enables level-0 messages                                                          |
- * | -lN        | maximum level N, 0 to 6; 7 to 9 are ignored; anything else sets 0 and logs an error |
- * | -mN,N,...  | enables only the modules listed (1 to 32); several such tokens of one call add up  |
- * | other -... | ignored                                                                           |
- * | NAME       | log file path "/tmp/NAME.txt", cut to 31 characters                               |
+ * | token      | effect                                                                                   |
+ * |------------|------------------------------------------------------------------------------------------|
+ * | -s, -f, -c | stream 1, 2 or 3; -c also records the callback and its parameter                         |
+ * | -a         | enables every module                                                                     |
+ * | -t         | enables level-0 messages                                                                 |
+ * | -lN        | one digit: maximum level 0 to 6, 7 to 9 are ignored; no digit: 0, and an error is logged |
+ * | -mN,N,...  | enables only the modules listed; several such tokens of one call add up                  |
+ * | other -... | ignored, longer level tokens such as -l12 among them                                     |
+ * | NAME       | log file path "/tmp/NAME.txt", cut to 31 characters                                      |
+ *
+ * In a module list, numbers outside 1 to 32 are ignored, and what is no number is logged as an error and skipped. A
+ * list without a valid number changes nothing.
  *
  * When an allocation fails, that is logged and the rest of the string is dropped; what was applied
  * before stays. Takes no lock; each global is set atomically.

@@ -10,6 +10,9 @@
  * A handle is the address of a process-local object, always positive on success. It is valid until
  * tavo_msg_queue_destroy(); a handle that is not valid is not recognised, and using it is undefined.
  *
+ * Every handle holds both ends of the pipe. So a put never meets a pipe without a reader, raises no SIGPIPE,
+ * and waits for room in a full queue even when no receiver is left.
+ *
  * No locks are taken. Several threads and processes may put messages of up to 4092 bytes at once; longer ones
  * need a single writer. One thread at a time gets. Calls to the service block until it answers.
  */
@@ -39,13 +42,15 @@ TAVO_API TAVO_Status tavo_android_msg_queue_init(TAVO_INT64* piMqId);
  * @param pcServiceName the key as decimal text; a text that is no number is key 0, which no queue has. A number
  *                      beyond 32 bits counts as the nearest that fits. At most 64 characters are looked at
  * @param piMqId        receives the handle; untouched on failure
- * @return #TAVO_SUCCESS; #TAVO_MQ_INVALID_POINTER: a pointer is null; a plain 1: the service is not reachable;
+ * @return #TAVO_SUCCESS; #TAVO_MQ_INVALID_POINTER: a pointer is null; a plain 1: the service is not reachable, which
+ *         takes five seconds to tell where a server has been before;
  *         #TAVO_MQ_NOT_AVAILABLE: the service has no queue for the key; #TAVO_NO_MEMORY: no queue object could be made
  */
 TAVO_API TAVO_Status tavo_msg_queue_sender_init(TAVO_CHAR* pcServiceName, TAVO_INT64* piMqId);
 
 /**
- * Sends one message. Blocks while the queue is full.
+ * Sends one message. Blocks while the queue is full: it holds 64 KiB of lengths and messages, more once large messages
+ * are put, so that a thread that puts to itself must get in between.
  *
  * @param iMqId  handle; not checked
  * @param pbMsg  the message; only read
@@ -56,7 +61,8 @@ TAVO_API TAVO_Status tavo_msg_queue_sender_init(TAVO_CHAR* pcServiceName, TAVO_I
 TAVO_API TAVO_Status tavo_msg_queue_put(TAVO_INT64 iMqId, unsigned char* pbMsg, unsigned int uiSize);
 
 /**
- * Receives one message. Blocks until there is one. A message whose rest does not come within a second is
+ * Receives one message. Blocks until there is one, for ever when nobody sends: every process that is attached holds
+ * both ends. A message whose rest does not come within a second is
  * given as far as it came.
  *
  * @param iMqId   handle; not checked

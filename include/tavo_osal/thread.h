@@ -18,7 +18,8 @@
  *
  * This library never leaves anything of its own half way: while one of its functions holds a lock that callers
  * cannot see (an event's, a timer framework's, the one that guards thread handles), allocates, or writes a message,
- * the end is put off until that is done. Callbacks of timers are the caller's code and may be cancelled.
+ * the end is put off until that is done. Callbacks of timers are the caller's code and may be cancelled. All this is
+ * about SIGUSR2; a platform's own pthread_cancel() is not for threads that use this library.
  *
  * ## Handles of threads that are gone
  *

@@ -3,12 +3,12 @@
 #include <binder/MemoryHeapBase.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cstring>
 #include <new>
 
+#include "ipc/descriptors.h"
 #include "ipc/fake_binders.h"
 #include "ipc/log_lines.h"
 #include "support/process.h"
@@ -22,10 +22,13 @@ using android::sp;
 using android::status_t;
 using tavo::test::ExpectedLine;
 using tavo::test::FakeRemote;
+using tavo::test::file_of;
+using tavo::test::is_open;
 using tavo::test::kBinderTag;
 using tavo::test::library_lines;
 using tavo::test::LogCapture;
 using tavo::test::logged_exactly;
+using tavo::test::NoInput;
 
 struct Operation {
     const char* name;
@@ -33,6 +36,8 @@ struct Operation {
     int empty;  // what an empty reply yields
     int (*call)(ITavoBinder& proxy, int key);
 };
+
+void PrintTo(const Operation& operation, std::ostream* out) { *out << operation.name; }
 
 const Operation kIntOperations[] = {
     {"delete_shared_mem", 4, 0, [](ITavoBinder& proxy, int key) { return proxy.delete_shared_mem(key); }},
@@ -70,26 +75,19 @@ protected:
 
 // The policy word, the descriptor's length, its UTF-16 units with the terminator, and the arguments.
 std::vector<uint8_t> request_bytes(int32_t policy, std::initializer_list<int32_t> arguments) {
-    std::vector<uint8_t> bytes(4);
-    memcpy(bytes.data(), &policy, 4);
-    const uint8_t token[] = {7, 0, 0, 0, 't', 0, 'a', 0, 'v', 0, 'o', 0, '.', 0, 'm', 0, 'q', 0, 0, 0};
-    bytes.insert(bytes.end(), std::begin(token), std::end(token));
-    for (const int32_t argument : arguments) {
-        uint8_t word[4];
-        memcpy(word, &argument, 4);
-        bytes.insert(bytes.end(), word, word + 4);
-    }
+    std::vector<uint8_t> bytes;
+    const auto append = [&bytes](const void* data, size_t size) {
+        const auto* begin = static_cast<const uint8_t*>(data);
+        for (size_t i = 0; i < size; ++i) bytes.push_back(begin[i]);
+    };
+    const uint8_t descriptor[] = {7, 0, 0, 0, 't', 0, 'a', 0, 'v', 0, 'o', 0, '.', 0, 'm', 0, 'q', 0, 0, 0};
+    append(&policy, sizeof policy);
+    append(descriptor, sizeof descriptor);
+    for (const int32_t argument : arguments) append(&argument, sizeof argument);
     return bytes;
 }
 
 constexpr int32_t kNoPolicy = 0x400000;  // the platform's own bit alone
-
-ino_t file_of(int descriptor) {
-    struct stat status = {};
-    return fstat(descriptor, &status) == 0 ? status.st_ino : 0;
-}
-
-bool is_open(int descriptor) { return fcntl(descriptor, F_GETFD) >= 0; }
 
 // --- every operation
 
@@ -195,14 +193,11 @@ TEST_P(BinderProxyDescriptor, IsNotInheritedByOtherPrograms) {
 }
 
 TEST_P(BinderProxyDescriptor, IsNeverDescriptorZero) {
-    answer_with(ends_[0]);
-    const int input = fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, 3);
-    close(STDIN_FILENO);
+    remote_->answer = [this](Parcel* reply) { return reply->writeFileDescriptor(ends_[0]); };
+    const NoInput input;
     const int descriptor = call(7);
     EXPECT_GT(descriptor, 0);
     EXPECT_FALSE(is_open(0));
-    dup2(input, STDIN_FILENO);
-    close(input);
     close(descriptor);
 }
 

@@ -76,6 +76,8 @@ struct DescriptorCode {
     const char* operation;
 };
 
+void PrintTo(const DescriptorCode& code, std::ostream* out) { *out << code.operation; }
+
 class BinderStubDescriptor : public BinderStub, public testing::WithParamInterface<DescriptorCode> {};
 
 TEST_P(BinderStubDescriptor, WritesTheDescriptorWithoutTakingIt) {
@@ -177,6 +179,8 @@ struct LoggedCode {
     uint32_t code;
     std::vector<ExpectedLine> lines;  // behind the entry
 };
+
+void PrintTo(const LoggedCode& logged, std::ostream* out) { *out << logged.code; }
 
 class BinderStubLog : public BinderStub, public testing::WithParamInterface<LoggedCode> {};
 

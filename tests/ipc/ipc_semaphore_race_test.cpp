@@ -11,51 +11,33 @@
 #include <unistd.h>
 
 #include <atomic>
-#include <chrono>
 #include <cstdio>
-#include <cstring>
+#include <cstdlib>
 #include <map>
-#include <memory>
 #include <string>
 #include <vector>
 
+#include "ipc/ipc_semaphore_test.h"
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
 #include "support/process.h"
-#include "tavo_osal/ipc_semaphore.h"
+#include "tavo_osal/thread.h"
+#include "thread/asleep.h"
 
 namespace {
 
+using tavo::test::count_descriptors;
+using tavo::test::count_of;
+using tavo::test::expect_working;
 using tavo::test::LogCapture;
 using tavo::test::logged;
+using tavo::test::open_semaphore;
 using tavo::test::PlatformHook;
 using tavo::test::Process;
+using tavo::test::status_of;
 
-constexpr uint32_t kKey = 10;
-constexpr char kPath[] = "/sdcard/10";
-
-sem_t* semaphore_of(TAVO_INT64 handle) { return reinterpret_cast<sem_t*>(static_cast<intptr_t>(handle)); }
-
-int count_of(TAVO_INT64 handle) {
-    int count = -1;
-    sem_getvalue(semaphore_of(handle), &count);
-    return count;
-}
-
-// The semaphore works: one gets in, and nobody else.
-void expect_working(TAVO_INT64 handle) {
-    EXPECT_EQ(tavo_semaphore_acquire(handle), TAVO_SUCCESS);
-    EXPECT_EQ(sem_trywait(semaphore_of(handle)), -1);
-    EXPECT_EQ(errno, EAGAIN);
-    EXPECT_EQ(tavo_semaphore_release(handle), TAVO_SUCCESS);
-    EXPECT_EQ(count_of(handle), 1);
-}
-
-TAVO_INT64 open_semaphore() {
-    TAVO_INT64 handle = 0;
-    EXPECT_EQ(tavo_semaphore_init(kKey, &handle), TAVO_SUCCESS);
-    return handle;
-}
+constexpr auto kKey = tavo::test::kSemaphoreKey;
+constexpr auto& kPath = tavo::test::kSemaphoreFile;
 
 // Replacements for a platform call that end the process in front of it or behind it.
 template <auto Call>
@@ -199,6 +181,22 @@ TEST(IpcSemaphoreRace, AnOpenerWaitsForACreatorThatIsStillAtIt) {
     expect_working(open_semaphore());
 }
 
+TEST(IpcSemaphoreRace, OpenersThatWaitTakeOverFromACreatorThatIsKilled) {
+    Process creator = Process::start("stopped_creator", {"initialisation"});
+    ASSERT_EQ(creator.read_line(), "stopped");
+    Process first = Process::start("opener");
+    Process second = Process::start("opener");
+    ASSERT_EQ(first.read_line(), "opening");
+    ASSERT_EQ(second.read_line(), "opening");
+    creator.kill(SIGKILL);
+    EXPECT_EQ(creator.wait(), -SIGKILL);
+    EXPECT_EQ(first.read_line(), "1");
+    EXPECT_EQ(second.read_line(), "1");
+    EXPECT_EQ(first.wait(), 0);
+    EXPECT_EQ(second.wait(), 0);
+    expect_working(open_semaphore());
+}
+
 TEST(IpcSemaphoreRace, AnOpenerGivesACreatorUpThatStaysStopped) {
     Process creator = Process::start("stopped_creator", {"initialisation"});
     ASSERT_EQ(creator.read_line(), "stopped");
@@ -206,11 +204,40 @@ TEST(IpcSemaphoreRace, AnOpenerGivesACreatorUpThatStaysStopped) {
     TAVO_INT64 handle = 42;
     EXPECT_EQ(tavo_semaphore_init(kKey, &handle), TAVO_FAILURE);
     EXPECT_EQ(handle, 42);
-    EXPECT_TRUE(logged(log.lines(), {1, "TAVO_OSAL", "Error in open shm_file /sdcard/10\n"}));
+    EXPECT_TRUE(logged(log.lines(), {1, "TAVO_OSAL", "Error in open shm_file /sdcard/4660\n"}));
 
     creator.kill(SIGKILL);
     EXPECT_EQ(creator.wait(), -SIGKILL);
     expect_working(open_semaphore());
+}
+
+TEST(IpcSemaphoreRace, AThreadThatIsCancelledWhileItCreatesFinishesFirst) {
+    const size_t descriptors = count_descriptors();
+    const PlatformHook hook(
+        "libtavoosal.so", "sem_init", +[](sem_t* semaphore, int shared, unsigned value) {
+            tavo_osal_thread_cancel(pthread_self());
+            return sem_init(semaphore, shared, value);
+        });
+    static bool returned;
+    returned = false;
+    const auto create = [](void*) -> void* {
+        TAVO_INT64 handle = 0;
+        tavo_semaphore_init(kKey, &handle);
+        returned = true;
+        return nullptr;
+    };
+    pthread_t thread = {};
+    ASSERT_EQ(tavo_osal_thread_create(&thread, create, nullptr), TAVO_SUCCESS);
+    EXPECT_EQ(tavo_osal_thread_join(thread), TAVO_SUCCESS);
+    EXPECT_EQ(count_descriptors(), descriptors);
+    EXPECT_EQ(status_of(kPath).st_size, static_cast<off_t>(sizeof(sem_t)));
+    // ThreadSanitizer delivers signals late.
+    EXPECT_TRUE(!returned || tavo::test::kThreadSanitizer);
+
+    // Another process is not held up by the lock of this one, which lives.
+    Process opener = Process::start("opener");
+    EXPECT_EQ(opener.read_line(), "opening");
+    EXPECT_EQ(opener.read_line(), "1");
 }
 
 TEST(IpcSemaphoreRace, ACreatorThatIsOvertakenDoesNotInitialiseAgain) {

@@ -131,14 +131,18 @@ TEST(MessageQueueDestructor, ClosesTheReadEndFirstAndNothingNegative) {
     auto whole = std::make_unique<TAVO_MessageQueue>();
     auto half = std::make_unique<TAVO_MessageQueue>();
     half->tavo_android_msg_queue_set_fd(-1);
-    const std::vector<int> expected = {whole->iReadFd, whole->iWriteFd, half->iWriteFd};
+    auto none = std::make_unique<TAVO_MessageQueue>();
+    none->tavo_android_msg_queue_set_fd(0);
+    none->tavo_android_msg_queue_set_write_fd(0);
+    const std::vector<int> expected = {whole->iReadFd, whole->iWriteFd, half->iWriteFd, 0, 0};
     const PlatformHook hook(
         "libtavoosal.so", "close", +[](int fd) {
             closed.push_back(fd);
-            return close(fd);
+            return fd == 0 ? 0 : close(fd);
         });
     whole.reset();
     half.reset();
+    none.reset();
     EXPECT_EQ(closed, expected);
 }
 

@@ -142,6 +142,8 @@ struct KeyText {
     int key;
 };
 
+void PrintTo(const KeyText& key, std::ostream* out) { *out << key.key; }
+
 class AttachKey : public Attach, public testing::WithParamInterface<KeyText> {};
 
 TEST_P(AttachKey, IsTheSameWhenAttachingAndDestroying) {

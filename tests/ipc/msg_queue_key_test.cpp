@@ -8,12 +8,12 @@
 
 #include <cerrno>
 #include <climits>
-#include <cstdio>
 #include <cstring>
 #include <fstream>
 #include <string>
 
-#include "ipc/server_process.h"
+#include "ipc/eventually.h"
+#include "ipc/server.h"
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
 #include "support/process.h"
@@ -26,7 +26,7 @@ using tavo::test::count_descriptors;
 using tavo::test::LogCapture;
 using tavo::test::logged_exactly;
 using tavo::test::PlatformHook;
-using tavo::test::ServerProcess;
+using tavo::test::Server;
 
 constexpr char kTag[] = "OSAL_MSG_QUEUE";
 constexpr char kKeyFile[] = "/sdcard/key_gen_file.txt";
@@ -162,7 +162,7 @@ struct KeyAndText {
 class MsgQueueKeys : public testing::TestWithParam<KeyAndText> {};
 
 TEST_P(MsgQueueKeys, OpenTheQueueOfTheirText) {
-    const ServerProcess server;
+    const Server server;
     const TAVO_INT64 by_number = open_queue(GetParam().key);
     const TAVO_INT64 by_text = open_queue(GetParam().text);
     ASSERT_GT(by_number, 0);
@@ -181,7 +181,7 @@ INSTANTIATE_TEST_SUITE_P(Keys, MsgQueueKeys,
                          [](const auto& test) { return "Case" + std::to_string(test.index); });
 
 TEST(MsgQueueByKey, IgnoresFlags) {
-    const ServerProcess server;
+    const Server server;
     const TAVO_INT64 plain = open_queue(7);
     TAVO_INT64 flagged = -1;
     EXPECT_EQ(tavo_msg_queue_init_with_flags(7, 0x1FF, &flagged), TAVO_SUCCESS);
@@ -195,7 +195,7 @@ TEST(MsgQueueByKey, IgnoresFlags) {
 }
 
 TEST(MsgQueueByKey, TakesTheSizeBeforeTheBuffer) {
-    const ServerProcess server;
+    const Server server;
     const TAVO_INT64 queue = open_queue(7);
     ASSERT_GT(queue, 0);
     EXPECT_EQ(tavo_msg_queue_sendmessage(queue, 3, bytes("abcdef")), TAVO_SUCCESS);
@@ -209,7 +209,7 @@ TEST(MsgQueueByKey, TakesTheSizeBeforeTheBuffer) {
 }
 
 TEST(MsgQueueByKey, CloseDropsTheUseInTheService) {
-    const ServerProcess server;
+    const Server server;
     EXPECT_EQ(tavo_msg_queue_close(open_queue(8)), TAVO_SUCCESS);  // makes the way to the service, which stays
     const size_t here = count_descriptors();
     const TAVO_INT64 first = open_queue(7);
@@ -231,7 +231,7 @@ TEST(MsgQueueByKey, PassesFailuresThrough) {
     EXPECT_EQ(tavo_msg_queue_close(0), TAVO_FAILURE);
     EXPECT_EQ(tavo_msg_queue_close(-1), TAVO_FAILURE);
 
-    const ServerProcess server;
+    const Server server;
     queue = open_queue(7);
     ASSERT_GT(queue, 0);
     EXPECT_EQ(tavo_msg_queue_sendmessage(queue, 1, nullptr), TAVO_INVALID_PARAM);
@@ -243,14 +243,14 @@ TEST(MsgQueueByKey, PassesFailuresThrough) {
 }
 
 TEST(MsgQueueByKey, HasNoQueueForKeyZero) {
-    const ServerProcess server;
+    const Server server;
     TAVO_INT64 queue = kUntouched;
     EXPECT_EQ(tavo_msg_queue_init(0, &queue), TAVO_MQ_NOT_AVAILABLE);
     EXPECT_EQ(queue, kUntouched);
 }
 
 TEST(MsgQueueByKey, LogsNothingOfItsOwn) {
-    const ServerProcess server;
+    const Server server;
     const LogCapture log;
     const TAVO_INT64 queue = open_queue(7);
     EXPECT_EQ(tavo_msg_queue_sendmessage(queue, 1, bytes("a")), TAVO_SUCCESS);

@@ -177,6 +177,8 @@ struct Failure {
     TAVO_Status of_put, of_get;
 };
 
+void PrintTo(const Failure& failure, std::ostream* out) { *out << failure.name; }
+
 class LocalQueueFailing : public LocalQueue, public testing::WithParamInterface<Failure> {
 protected:
     LocalQueueFailing() { g_error = GetParam().error; }

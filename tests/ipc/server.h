@@ -27,6 +27,7 @@ public:
     void kill();
 
 private:
+    static Process start(unsigned queues, unsigned blocks);
     std::string ask(const std::string& question);
 
     Process process_;

@@ -1,5 +1,4 @@
 #include <gtest/gtest.h>
-#include <stdlib.h>
 #include <sys/ipc.h>
 #include <sys/stat.h>
 #include <unistd.h>

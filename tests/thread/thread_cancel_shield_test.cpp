@@ -165,6 +165,9 @@ TEST_F(ThreadCancelShield, AMessageIsFinishedBeforeTheThreadEnds) {
 // Cancels threads that never stop using one event, at whatever instruction they happen to be. What is left behind must
 // not keep the next one, or the test, from using it.
 TEST_F(ThreadCancelShield, NoMomentIsABadOneForCancellingAThreadThatUsesAnEvent) {
+    // Under load it was seen to keep a delivered signal to itself until the thread's next blocking call, which a
+    // thread that uses an event on its own need not make.
+    if (kThreadSanitizer) GTEST_SKIP() << "ThreadSanitizer may hold a signal back for ever";
     // Threads of a sanitizer's must not be ended before they have begun.
     static std::atomic<int> begun;
     const auto use = +[](void* opaque) -> void* {
@@ -178,10 +181,8 @@ TEST_F(ThreadCancelShield, NoMomentIsABadOneForCancellingAThreadThatUsesAnEvent)
             tavo_osal_event_clear(event);
         }
     };
-    const int rounds = kThreadSanitizer ? 50 : 500;
-    // ThreadSanitizer delivers signals late, and may do so when a thread is past the last look before its sleep. One
-    // thread on its own never has to sleep.
-    const size_t at_once = kThreadSanitizer ? 1 : 2;
+    constexpr int rounds = 500;
+    constexpr size_t at_once = 2;
     for (int round = 0; round < rounds; ++round) {
         std::vector<pthread_t> threads(at_once);
         begun = 0;

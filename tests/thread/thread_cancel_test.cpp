@@ -287,6 +287,17 @@ TEST(ThreadCancellation, IsReportedByTheCallerAndByTheThread) {
     EXPECT_TRUE(logged(lines, {3, kTag, " This signal is 12 \n"}));
 }
 
+TEST(ThreadCancellation, ByThePlatformsOwnMeansReleasesAnEventToo) {
+    Place place;
+    const LogCapture log;
+    pthread_t thread = {};
+    ASSERT_EQ(tavo_osal_thread_create(&thread, in_event, &place), TAVO_SUCCESS);
+    place.bedside.wait_until_asleep();
+    EXPECT_EQ(pthread_cancel(thread), 0);
+    EXPECT_EQ(tavo_osal_thread_join(thread), TAVO_SUCCESS);
+    EXPECT_TRUE(logged_exactly(log.lines(), {}));
+}
+
 TEST(ThreadCancellation, ASignalThatCannotBeSentIsSilentAndSucceeds) {
     Place place;
     const LogCapture log;

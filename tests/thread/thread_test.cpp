@@ -76,7 +76,8 @@ TEST(Thread, CreateInstallsTheCancellationHandlerWithoutFlagsOrMask) {
     EXPECT_EQ(tavo_osal_thread_join(thread), TAVO_SUCCESS);
     const struct sigaction action = installed_for(SIGUSR2);
     EXPECT_NE(action.sa_handler, SIG_DFL);
-    EXPECT_EQ(action.sa_flags & (SA_RESTART | SA_NODEFER | SA_RESETHAND | SA_SIGINFO | SA_ONSTACK | SA_NOCLDSTOP), 0);
+    constexpr int kFlags[] = {SA_RESTART, SA_NODEFER, static_cast<int>(SA_RESETHAND), SA_SIGINFO, SA_ONSTACK};
+    for (const int flag : kFlags) EXPECT_FALSE(action.sa_flags & flag) << flag;
     for (int signal = 1; signal < 32; ++signal) EXPECT_EQ(sigismember(&action.sa_mask, signal), 0) << signal;
 }
 

@@ -167,8 +167,9 @@ TEST_F(File, TellsSizes) {
 
 TEST_F(File, TellsSizesBeyond32BitsWherePositionsReachThem) {
     if (sizeof(long) == 4) GTEST_SKIP() << "positions have 32 bits here";
-    ASSERT_EQ(truncate(kPath, off_t{5} << 30), 0);
-    EXPECT_EQ(tavo_osal_get_file_size(kPath), int64_t{5} << 30);
+    constexpr int64_t kSize = int64_t{5} << 30;
+    ASSERT_EQ(truncate(kPath, static_cast<off_t>(kSize)), 0);
+    EXPECT_EQ(tavo_osal_get_file_size(kPath), kSize);
 }
 
 TEST_F(File, ReportsANullPathForTheSize) {

@@ -3,6 +3,7 @@
 
 #include <cstdint>
 #include <memory>
+#include <utility>
 
 #include "RemoteHeap.h"
 
@@ -10,8 +11,8 @@ namespace android {
 
 class BpMemoryHeap : public BpInterface<IMemoryHeap> {
 public:
-    explicit BpMemoryHeap(const sp<IBinder>& remote)
-        : BpInterface<IMemoryHeap>(remote), mHeap(RemoteHeap::of(remote)) {}
+    // What can fail for want of memory comes first: a RefBase whose construction goes on to fail leaks.
+    explicit BpMemoryHeap(const sp<IBinder>& remote) : BpMemoryHeap(remote, RemoteHeap::of(remote)) {}
 
     int getHeapID() const override { return mHeap->mapping().fd; }
     void* getBase() const override { return mHeap->mapping().base; }
@@ -20,6 +21,9 @@ public:
     uint32_t getOffset() const override { return mHeap->mapping().offset; }
 
 private:
+    BpMemoryHeap(const sp<IBinder>& remote, std::shared_ptr<RemoteHeap> heap)
+        : BpInterface<IMemoryHeap>(remote), mHeap(std::move(heap)) {}
+
     const std::shared_ptr<RemoteHeap> mHeap;
 };
 

@@ -38,12 +38,14 @@ bool staysLargeEnough(int fd, uint64_t end) {
 }  // namespace
 
 std::shared_ptr<RemoteHeap> RemoteHeap::of(const sp<IBinder>& binder) {
+    // Declared first and made in one piece: when memory runs out, no heap may go while the lock is held.
+    std::shared_ptr<RemoteHeap> heap;
     const std::lock_guard<std::mutex> lock(cache().lock);
-    std::weak_ptr<RemoteHeap>& entry = cache().heaps[binder.get()];
-    std::shared_ptr<RemoteHeap> heap = entry.lock();
+    const auto entry = cache().heaps.find(binder.get());
+    if (entry != cache().heaps.end()) heap = entry->second.lock();
     if (heap == nullptr) {
-        heap.reset(new RemoteHeap(binder));
-        entry = heap;
+        heap = std::make_shared<RemoteHeap>(Key(), binder);
+        cache().heaps[binder.get()] = heap;
     }
     return heap;
 }

@@ -13,10 +13,14 @@
 namespace android {
 
 class RemoteHeap {
+    // Only of() has one.
+    struct Key {};
+
 public:
     // What every proxy for the same object shares. Nothing is mapped yet.
     static std::shared_ptr<RemoteHeap> of(const sp<IBinder>& binder);
 
+    RemoteHeap(Key, const sp<IBinder>& binder) : mBinder(binder) {}
     ~RemoteHeap();
     RemoteHeap(const RemoteHeap&) = delete;
     RemoteHeap& operator=(const RemoteHeap&) = delete;
@@ -33,8 +37,6 @@ public:
     const Mapping& mapping();
 
 private:
-    explicit RemoteHeap(const sp<IBinder>& binder) : mBinder(binder) {}
-
     status_t ask(Mapping* mapping);
 
     const sp<IBinder> mBinder;

@@ -29,8 +29,8 @@ class AsyncCalls {
 public:
     enum class Admission { kRefused, kQueued, kQueuedFirst };
 
-    // Refused, and nothing taken, when the caller's process has too many waiting. Whoever queued the first one must have
-    // them run.
+    // Refused, and nothing taken, when the caller's process has too many waiting. Whoever queued the first one must
+    // have them run.
     Admission admit(AsyncCall& call);
     // Runs the object's calls until none is left.
     void run(const BBinder* target, const std::function<void(AsyncCall&)>& execute);

@@ -40,8 +40,8 @@ status_t Directory::publish(const std::string& name, const sp<IBinder>& service)
     RuntimeDirectory::Unnamed unnamed;
     status_t status = runtime_.listen(unnamed);
     if (status != OK) return status;
-    const auto listener = std::make_shared<Listener>(
-        std::move(unnamed.socket), [this](UniqueFd connection) { welcome(std::move(connection)); });
+    const auto listener = std::make_shared<Listener>(std::move(unnamed.socket),
+                                                     [this](UniqueFd connection) { welcome(std::move(connection)); });
     status = neighbourhood_.addListener(listener) ? runtime_.give(unnamed, name) : status_t{NO_MEMORY};
     if (status != OK) {
         neighbourhood_.removeListener(listener->id);

@@ -205,8 +205,7 @@ int sendFrame(int fd, const OutgoingFrame& frame, size_t& sent, int flags) {
     while (sent < size) {
         const bool here = withDescriptors && sent == descriptorsAt;
         Segments segments(frame, sent, sent < descriptorsAt ? descriptorsAt : size);
-        const ssize_t count =
-            sendMessage(fd, segments.parts, segments.count, here ? frame.descriptors : kNone, flags);
+        const ssize_t count = sendMessage(fd, segments.parts, segments.count, here ? frame.descriptors : kNone, flags);
         if (count >= 0) {
             sent += static_cast<size_t>(count);
         } else if (here && sent > 0 && !isOfTheConnection(errno)) {

@@ -84,8 +84,8 @@ int sendFrame(int fd, const OutgoingFrame& frame, size_t& sent, int flags);
 // What a peer has not taken yet of a frame.
 class UnsentFrame {
 public:
-    // Null when there is no memory for a copy, or no descriptor. Of a frame that is on its way already, it rather leaves
-    // out the descriptors.
+    // Null when there is no memory for a copy, or no descriptor. Of a frame that is on its way already, it rather
+    // leaves out the descriptors.
     static std::unique_ptr<UnsentFrame> copy(const OutgoingFrame& frame, size_t sent);
 
     // 0 when nothing is left, else errno.

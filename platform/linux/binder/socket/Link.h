@@ -86,19 +86,20 @@ public:
     // A link that was made by an introduction lasts no longer than what came with it is in use.
     void setTemporary() { temporary_ = true; }
     bool isTemporary() const { return temporary_; }
-    // Counts a connection made for a third process to meet this one, as long as it has not. False when there are too many.
+    // Counts a connection made for a third process to meet this one, as long as it has not. False when there are too
+    // many.
     bool addIntroduction(const std::shared_ptr<Link>& introduced);
 
     bool dead() const { return dead_; }
     // Calls that wait on this link fail, and no new one starts. The end itself is reported by the poller.
     void cut();
 
-    // Waits for its turn while as many as the peer takes are in use. One that is not to be `fresh` was in use before, by
-    // this process's word for it or the peer's there is no room for more. DEAD_OBJECT when the peer is gone, NO_MEMORY when
-    // there is none to be had.
+    // Waits for its turn while as many as the peer takes are in use. One that is not to be `fresh` was in use before,
+    // by this process's word for it or the peer's there is no room for more. DEAD_OBJECT when the peer is gone,
+    // NO_MEMORY when there is none to be had.
     status_t takeChannel(Purpose purpose, bool mayBeFresh, Channel& channel);
-    // After a fresh channel was closed: waits for the peer's word on it. DEAD_OBJECT when the peer is gone, NO_MEMORY when
-    // it has no room.
+    // After a fresh channel was closed: waits for the peer's word on it. DEAD_OBJECT when the peer is gone, NO_MEMORY
+    // when it has no room.
     status_t heedRefusal();
 
     // Channels that the peer calls on, by their number at the poller.
@@ -128,7 +129,7 @@ private:
 
     struct Outgoing {
         std::vector<UniqueFd> idle;
-        size_t open = 0;                      // idle ones and those in use
+        size_t open = 0;                     // idle ones and those in use
         std::deque<const Channel*> waiting;  // in the order of their coming
     };
     // A place in the queue for a channel.

@@ -16,8 +16,8 @@ class Introducer {
 public:
     // A control connection to the process behind the route, to be passed on: whoever gets it has one reference.
     virtual status_t introduce(const References::Route& route, UniqueFd& control) = 0;
-    // What is at the other end of such a connection: an object of this process's own, or a handle in use once more. False
-    // when the connection is not what it should be.
+    // What is at the other end of such a connection: an object of this process's own, or a handle in use once more.
+    // False when the connection is not what it should be.
     virtual bool meet(UniqueFd control, sp<BBinder>& own, int32_t& handle) = 0;
 
 protected:

@@ -58,7 +58,7 @@ public:
 
     // What the end of a link leaves to be done.
     struct Estate {
-        std::vector<sp<BBinder>> objects;     // to be dropped
+        std::vector<sp<BBinder>> objects;    // to be dropped
         std::vector<wp<BpBinder>> mourners;  // who asked to hear of it, each once
     };
     Estate end(Link& link);

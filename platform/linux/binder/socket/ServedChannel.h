@@ -56,7 +56,6 @@ public:
     // Lets go of the channel and has the poller look at it again.
     void resume();
 
-
 private:
     bool readFrames();
     // False when the peer will not take all of it yet.

@@ -76,7 +76,7 @@ void SocketDriver::joinThreadPool(bool isMain) {
         SocketDriver& driver;
         ~Leaving() { driver.sortFromNowOn(); }
     };
-    const Leaving leaving{*this};
+    [[maybe_unused]] const Leaving leaving{*this};
     const ThreadBudget::Member member(threads_, !isMain);
     leaveArrivals();
     for (;;) {

@@ -10,8 +10,8 @@
 namespace android::socket_driver {
 namespace {
 
-// How deep calls may be nested on one thread. A peer decides how often it calls back before it answers, so something must
-// keep it from using up the stack.
+// How deep calls may be nested on one thread. A peer decides how often it calls back before it answers, so something
+// must keep it from using up the stack.
 constexpr size_t kMaxDepth = 256;
 
 }  // namespace

@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <cstring>
 #include <functional>
+#include <new>
 #include <thread>
 #include <vector>
 
@@ -276,6 +277,32 @@ TEST(RemoteHeap, WhoseDescriptorCannotBeDuplicatedIsNone) {
     EXPECT_EQ(client->getBase(), MAP_FAILED);
     ASSERT_EQ(log.lines("IMemory").size(), 1U);
     EXPECT_EQ(log.lines("IMemory")[0].text, "A heap of another process could not be mapped: -24");
+}
+
+int g_allocations_left;
+
+void* allocate_or_throw(size_t size) {
+    if (--g_allocations_left < 0) throw std::bad_alloc();
+    return operator new(size);
+}
+
+TEST(RemoteHeap, ThatCannotBeAllocatedIsThrownAndTheNextOneIsMade) {
+    const sp<MemoryHeapBase> heap = new MemoryHeapBase(kPage);
+    const sp<IBinder> proxy = LoopbackDriver::open().proxy(heap);
+    sp<IMemoryHeap> client;
+    int failures = 0;
+    for (int allocations = 0; client == nullptr && allocations < 20; ++allocations) {
+        g_allocations_left = allocations;
+        const PlatformHook hook("libbinder.so", "_Znwm", allocate_or_throw);
+        try {
+            client = interface_cast<IMemoryHeap>(proxy);
+        } catch (const std::bad_alloc&) {
+            ++failures;
+        }
+    }
+    ASSERT_NE(client, nullptr);
+    EXPECT_GE(failures, 3);  // the proxy, what its like share, and that one's place among all
+    EXPECT_NE(client->getBase(), MAP_FAILED);
 }
 
 TEST(RemoteHeap, OfADeadProcessThatWasNeverMappedIsNone) {

@@ -18,8 +18,8 @@ Parcel& numbered(Parcel& data, int32_t number) {
 
 bool echoes(const sp<IBinder>& service, int32_t number) {
     Parcel data, reply;
-    return service->transact(TestService::kEcho, numbered(data, number), &reply) == OK &&
-           reply.readInt32() == number && reply.readString16() == String16("text");
+    return service->transact(TestService::kEcho, numbered(data, number), &reply) == OK && reply.readInt32() == number &&
+           reply.readString16() == String16("text");
 }
 
 // Threads whose calls are held up, for as long as this lives.

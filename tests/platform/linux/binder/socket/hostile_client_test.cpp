@@ -209,8 +209,8 @@ TEST_F(SocketHostileClient, SaysGarbageOnTheControlConnection) {
 
 // It hears of it: whoever calls must not wait for ever.
 TEST_F(SocketHostileClient, OffersWhatIsNoChannelOfItsOwn) {
-    const auto offer = bytes_of(
-        wire::ChannelOffer{{wire::kMagic, wire::ControlType::kChannel}, wire::Purpose::kCalls, 0});
+    const auto offer =
+        bytes_of(wire::ChannelOffer{{wire::kMagic, wire::ControlType::kChannel}, wire::Purpose::kCalls, 0});
     const RawPeer peer("test.service");
     const auto expect_refused = [&](int descriptor, const char* what) {
         EXPECT_TRUE(peer.say(offer, {descriptor}));

@@ -107,7 +107,8 @@ TEST_F(SocketHostileFlood, DoesNotTakeItsReplies) {
     // Each has its answer, of which the most part waits in the server.
     for (const UniqueFd& channel : channels) {
         wire::FrameHeader header{};
-        EXPECT_TRUE(eventually([&] { return recv(channel.get(), &header, sizeof header, MSG_PEEK | MSG_DONTWAIT) > 0; }));
+        EXPECT_TRUE(
+            eventually([&] { return recv(channel.get(), &header, sizeof header, MSG_PEEK | MSG_DONTWAIT) > 0; }));
     }
     expect_served();
     EXPECT_LE(count_threads_named(server_.pid(), "Binder_"), 18U);

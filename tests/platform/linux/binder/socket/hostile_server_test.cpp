@@ -81,8 +81,8 @@ TEST(SocketHostileServer, IsServedLikeOthersAsLongAsItBehaves) {
 TEST(SocketHostileServer, DoesNotGreet) {
     EXPECT_EQ(find_service("raw"), nullptr);
     const UniqueFd listener = listen_raw("raw");
-    for (const ByteString& welcome : {ByteString(), ByteString(1), ByteString(100, 7), ByteString(sizeof(wire::Greeting)),
-                                      ByteString(100000, 1)}) {
+    for (const ByteString& welcome :
+         {ByteString(), ByteString(1), ByteString(100, 7), ByteString(sizeof(wire::Greeting)), ByteString(100000, 1)}) {
         std::thread server([&] {
             const UniqueFd connection = accept_raw(listener.get(), false);
             if (!welcome.empty()) send_raw(connection.get(), welcome, {STDIN_FILENO});
@@ -123,9 +123,9 @@ TEST(SocketHostileServer, RepliesWithWhatIsNoReply) {
     EXPECT_EQ(outcome(reply_with([](auto& f) { f.add(WireObject::kReceiversNode, 1); })), DEAD_OBJECT);
     EXPECT_EQ(outcome(reply_with([](auto& f) { f.add(WireObject::kDescriptor, 3); })), DEAD_OBJECT);
     EXPECT_EQ(outcome(reply_with([](auto& f) {
-        f.add(WireObject::kNull, 0);
-        f.offsets[0] = 1000;
-    })),
+                  f.add(WireObject::kNull, 0);
+                  f.offsets[0] = 1000;
+              })),
               DEAD_OBJECT);
     EXPECT_EQ(outcome(reply_with([](auto& f) { f.descriptors = {STDIN_FILENO}; })), DEAD_OBJECT);
     EXPECT_EQ(outcome(answer_with(reply_frame().bytes(), {STDIN_FILENO})), DEAD_OBJECT);
@@ -134,11 +134,11 @@ TEST(SocketHostileServer, RepliesWithWhatIsNoReply) {
 TEST(SocketHostileServer, ClosesInsteadOfReplying) {
     EXPECT_EQ(outcome([](int channel) { shutdown(channel, SHUT_RDWR); }), DEAD_OBJECT) << "and gives no reason";
     EXPECT_EQ(outcome([](int channel) {
-        receive_frame(channel);
-        const ByteString half = bytes_of(reply_frame(0, ByteString(1000)).sized());
-        send_raw(channel, half);
-        shutdown(channel, SHUT_RDWR);
-    }),
+                  receive_frame(channel);
+                  const ByteString half = bytes_of(reply_frame(0, ByteString(1000)).sized());
+                  send_raw(channel, half);
+                  shutdown(channel, SHUT_RDWR);
+              }),
               DEAD_OBJECT);
 }
 

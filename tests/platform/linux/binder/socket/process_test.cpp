@@ -110,7 +110,8 @@ TEST(SocketProcess, WithoutDescriptorsTurnsNewcomersAwayAndServesTheOthers) {
         Parcel data, reply;
         data.writeFileDescriptor(STDIN_FILENO);
         EXPECT_EQ(service->transact(TestService::kEcho, data, &reply), FAILED_TRANSACTION);
-        EXPECT_EQ(service->transact(TestService::kOpenPipe, Parcel(), &reply), UNKNOWN_ERROR) << "the object's own word";
+        EXPECT_EQ(service->transact(TestService::kOpenPipe, Parcel(), &reply), UNKNOWN_ERROR)
+            << "the object's own word";
         // More callers than there are channels, of which no more can be had: they take turns.
         std::vector<std::thread> callers;
         for (int n = 0; n < 8; ++n) {

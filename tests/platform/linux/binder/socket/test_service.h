@@ -29,31 +29,31 @@ class TestService : public android::BBinder {
 public:
     enum Code : uint32_t {
         kEcho = android::IBinder::FIRST_CALL_TRANSACTION,  // the request is the reply
-        kCallerIds,       // -> pid, uid
-        kThreadId,        // -> of the thread that runs the call
-        kBlock,           // a Gate's descriptors: returns when the gate is opened
-        kPingPong,        // depth, binder: calls it with depth - 1 and this -> depth reached
-        kRelay,           // code, n, n binders: calls the first one with the rest, the last one with the code -> its reply
-        kKeep,            // binder, or a null one
-        kKept,            // -> what was kept
-        kTakeKept,        // -> what was kept, which is forgotten
-        kIsKept,          // binder -> whether it is what is kept
-        kIsKeptNamed,     // name -> whether what it stands for is what is kept
-        kPassKept,        // binder: has it keep what is kept here, which is forgotten
-        kIsThis,          // binder -> whether it is this very object
-        kCallKept,        // code, its request -> its reply
-        kPingKept,        // -> the status of a ping of what is kept
-        kWatchKept,       // wants to hear of its death
-        kDeaths,          // -> how many deaths were heard of
-        kOpenPipe,        // -> both ends
+        kCallerIds,                                        // -> pid, uid
+        kThreadId,                                         // -> of the thread that runs the call
+        kBlock,                                            // a Gate's descriptors: returns when the gate is opened
+        kPingPong,     // depth, binder: calls it with depth - 1 and this -> depth reached
+        kRelay,        // code, n, n binders: calls the first one with the rest, the last one with the code -> its reply
+        kKeep,         // binder, or a null one
+        kKept,         // -> what was kept
+        kTakeKept,     // -> what was kept, which is forgotten
+        kIsKept,       // binder -> whether it is what is kept
+        kIsKeptNamed,  // name -> whether what it stands for is what is kept
+        kPassKept,     // binder: has it keep what is kept here, which is forgotten
+        kIsThis,       // binder -> whether it is this very object
+        kCallKept,     // code, its request -> its reply
+        kPingKept,     // -> the status of a ping of what is kept
+        kWatchKept,    // wants to hear of its death
+        kDeaths,       // -> how many deaths were heard of
+        kOpenPipe,     // -> both ends
         kReplyDescriptor,  // descriptor number, size -> so many bytes and that descriptor, open or not
-        kBytes,           // size -> as many bytes
-        kAppend,          // number, milliseconds: notes the number after a while
-        kAppended,        // -> n, n numbers
-        kPublish,         // name, binder
-        kCheck,           // name -> binder
-        kEndThread,       // ends the thread that runs the call
-        kExit,            // exits
+        kBytes,            // size -> as many bytes
+        kAppend,           // number, milliseconds: notes the number after a while
+        kAppended,         // -> n, n numbers
+        kPublish,          // name, binder
+        kCheck,            // name -> binder
+        kEndThread,        // ends the thread that runs the call
+        kExit,             // exits
     };
 
     ~TestService() override;

@@ -17,7 +17,8 @@ constexpr size_t kLimit = 1024 * 1024;
 constexpr int kMostDescriptors = 253;
 
 bool same_file(int one, int other) {
-    struct stat a {}, b {};
+    struct stat a {
+    }, b{};
     return fstat(one, &a) == 0 && fstat(other, &b) == 0 && a.st_dev == b.st_dev && a.st_ino == b.st_ino;
 }
 
