@@ -113,9 +113,8 @@ TEST(SocketDeath, CannotBeAskedForAfterwards) {
     const sp<IBinder> service = find_service();
     server.kill(SIGKILL);
     server.wait();
-    const sp<Recipient> recipient = new Recipient;
-    EXPECT_EQ(service->pingBinder(), DEAD_OBJECT);  // from here on the process knows
-    EXPECT_EQ(service->linkToDeath(recipient), DEAD_OBJECT);
+    EXPECT_EQ(service->pingBinder(), DEAD_OBJECT);
+    EXPECT_EQ(service->linkToDeath(new Recipient), DEAD_OBJECT);
 }
 
 TEST(SocketDeath, LeavesTheNameToWhoComesNext) {
