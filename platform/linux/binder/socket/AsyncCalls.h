@@ -9,6 +9,7 @@
 #include <memory>
 #include <mutex>
 #include <unordered_map>
+#include <vector>
 
 #include "../Driver.h"
 #include "Link.h"
@@ -34,12 +35,23 @@ public:
     Admission admit(AsyncCall& call);
     // Runs the object's calls until none is left.
     void run(const BBinder* target, const std::function<void(AsyncCall&)>& execute);
+    // The process that made these calls is gone. They are still run, unless too many of such processes' wait already:
+    // then they are returned, to be dropped where it does no harm.
+    std::vector<AsyncCall> orphan(const Link& link);
 
 private:
-    static size_t costOf(const AsyncCall& call);
+    struct Sender {
+        size_t waiting = 0;  // what its calls take
+        bool isGone = false;
+    };
+    using Queue = std::deque<AsyncCall>;
+
+    void settle(const AsyncCall& call);
 
     std::mutex mutex_;
-    std::unordered_map<const BBinder*, std::deque<AsyncCall>> queues_;
+    std::unordered_map<const BBinder*, Queue> queues_;
+    std::unordered_map<const Link*, Sender> senders_;
+    size_t orphaned_ = 0;
 };
 
 }  // namespace android::socket_driver

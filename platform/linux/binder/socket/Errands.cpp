@@ -3,6 +3,7 @@
 #include <sys/eventfd.h>
 
 #include <algorithm>
+#include <iterator>
 #include <utility>
 
 namespace android::socket_driver {
@@ -16,6 +17,16 @@ void Errands::push(Errand errand) {
         ++count_;
     }
     ring();
+}
+
+void Errands::drop(const Link& link) {
+    std::deque<Errand> dropped;  // declared first: goes away without the lock
+    const std::lock_guard<std::mutex> lock(mutex_);
+    const auto first = std::stable_partition(errands_.begin(), errands_.end(),
+                                             [&link](const Errand& errand) { return errand.link != &link; });
+    std::move(first, errands_.end(), std::back_inserter(dropped));
+    errands_.erase(first, errands_.end());
+    count_ -= dropped.size();
 }
 
 bool Errands::take(Errand& errand, bool isPoolThread) {

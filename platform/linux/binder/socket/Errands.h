@@ -6,6 +6,7 @@
 #include <functional>
 #include <mutex>
 
+#include "Link.h"
 #include "Poller.h"
 #include "ThreadBudget.h"
 
@@ -15,6 +16,8 @@ struct Errand {
     std::function<void()> run;
     // Any thread that is in the driver anyway may do it where there is no pool.
     bool forAnyThread = false;
+    // Who wants it done.
+    const Link* link = nullptr;
 };
 
 // A thread that has time takes an errand before it waits for connections; one that waits already is woken.
@@ -24,6 +27,8 @@ public:
     bool valid() const { return bell_.valid(); }
 
     void push(Errand errand);
+    // Whoever wanted it is gone.
+    void drop(const Link& link);
     // False when there is none.
     bool take(Errand& errand, bool isPoolThread);
     bool empty() const { return count_ == 0; }

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <linux/android/binder.h>
+#include <sys/time.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -20,6 +21,10 @@ constexpr size_t kScratchSize = 4096;
 
 // What a larger frame's descriptors travel with. One packet of the kernel's always holds it.
 constexpr size_t kTailSize = 8;
+
+// SCM_PIDFD, which headers may lack. Who made a socket can have the kernel send one along with every message, and
+// whoever does not expect it keeps a descriptor each time.
+constexpr int kScmPidfd = 0x04;
 
 // The parts of a frame between two of its bytes.
 struct Segments {
@@ -76,7 +81,8 @@ bool isOfTheConnection(int error) { return error == EAGAIN || error == EPIPE || 
 ssize_t receive(int fd, iovec* buffers, size_t bufferCount, int flags, std::vector<UniqueFd>& descriptors, bool& lost,
                 ucred* sender) {
     // Not zeroed: this is on the path of every transaction, and the kernel says how much it wrote.
-    alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int) * kMaxDescriptors) + CMSG_SPACE(sizeof(ucred))];
+    alignas(cmsghdr) char
+        control[CMSG_SPACE(sizeof(int) * kMaxDescriptors) + CMSG_SPACE(sizeof(ucred)) + CMSG_SPACE(sizeof(int))];
     msghdr message{};
     message.msg_iov = buffers;
     message.msg_iovlen = bufferCount;
@@ -99,11 +105,21 @@ ssize_t receive(int fd, iovec* buffers, size_t bufferCount, int flags, std::vect
                 memcpy(&descriptor, CMSG_DATA(part) + i * sizeof(int), sizeof(int));
                 descriptors.emplace_back(descriptor);
             }
+        } else if (part->cmsg_type == kScmPidfd) {
+            int process = -1;
+            memcpy(&process, CMSG_DATA(part), sizeof process);
+            UniqueFd unwanted(process);
         } else if (part->cmsg_type == SCM_CREDENTIALS && sender != nullptr) {
             memcpy(sender, CMSG_DATA(part), sizeof *sender);
         }
     }
     return count;
+}
+
+void limitWaits(int fd) {
+    const timeval limit{5, 0};
+    setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof limit);
+    setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit);
 }
 
 ssize_t sendBytes(int fd, const void* bytes, size_t size, const std::vector<int>& descriptors, int flags) {

@@ -24,6 +24,9 @@ using Bytes = std::unique_ptr<uint8_t, FreeDeleter>;
 ssize_t receive(int fd, iovec* buffers, size_t bufferCount, int flags, std::vector<UniqueFd>& descriptors, bool& lost,
                 ucred* sender = nullptr);
 
+// From now on no call on the socket waits for ever: for what drivers say among themselves, which they do at once.
+void limitWaits(int fd);
+
 // One sendmsg of these bytes with these descriptors: the bytes sent, or -1.
 ssize_t sendBytes(int fd, const void* bytes, size_t size, const std::vector<int>& descriptors, int flags);
 

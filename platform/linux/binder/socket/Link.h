@@ -94,9 +94,8 @@ public:
     // Calls that wait on this link fail, and no new one starts. The end itself is reported by the poller.
     void cut();
 
-    // Waits for its turn while as many as the peer takes are in use. One that is not to be `fresh` was in use before,
-    // by this process's word for it or the peer's there is no room for more. DEAD_OBJECT when the peer is gone,
-    // NO_MEMORY when there is none to be had.
+    // Waits for its turn while as many as the peer takes are in use; where there turned out to be no room for a fresh
+    // one, until one of the others is idle. DEAD_OBJECT when the peer is gone, NO_MEMORY when none can be had.
     status_t takeChannel(Purpose purpose, bool mayBeFresh, Channel& channel);
     // After a fresh channel was closed: waits for the peer's word on it. DEAD_OBJECT when the peer is gone, NO_MEMORY
     // when it has no room.
@@ -106,10 +105,6 @@ public:
     bool addServed(uint64_t channel, Purpose purpose);
     void removeServed(uint64_t channel);
     std::vector<uint64_t> takeServed();
-
-    // Oneway calls of the peer's that are accepted and not run yet, by what they take.
-    bool addWaiting(size_t cost);
-    void removeWaiting(size_t cost) { waiting_ -= cost; }
 
     // Tells the peer that references to its node were given up here. Never blocks: what cannot be said now
     // is said when the peer has listened.
@@ -150,7 +145,6 @@ private:
     std::vector<std::weak_ptr<Link>> introductions_;  // only touched by the thread that keeps house
 
     std::atomic<bool> dead_{false};
-    std::atomic<size_t> waiting_{0};
 
     std::mutex mutex_;
     std::condition_variable changed_;

@@ -51,24 +51,36 @@ sp<BBinder> References::find(const Link& link, uint64_t node) {
     return gift != peer->second.gifts.end() ? gift->second.object : nullptr;
 }
 
+// A handle whose owner is dead stays dead, even if another process should bear the same marks.
+References::Handle* References::findUsable(const std::pair<Identity, uint64_t>& origin, const Link* link,
+                                           int32_t& number) {
+    const auto known = numbers_.find(origin);
+    if (known == numbers_.end()) return nullptr;
+    number = known->second;
+    Handle& handle = handles_[number];
+    const bool isSame = link != nullptr && findReceived(handle, *link) != handle.received.end();
+    return isSame || !isDead(handle) ? &handle : nullptr;
+}
+
 int32_t References::adopt(const std::shared_ptr<Link>& link, uint64_t node) {
     const std::lock_guard<std::mutex> lock(mutex_);
     const std::pair<Identity, uint64_t> origin(link->identity(), node);
-    int32_t& number = numbers_[origin];
-    if (number == 0) {
+    int32_t number = 0;
+    Handle* handle = findUsable(origin, link.get(), number);
+    if (handle == nullptr) {
         do {
             lastHandle_ = lastHandle_ == INT32_MAX ? 1 : lastHandle_ + 1;
         } while (handles_.count(lastHandle_) != 0);
-        number = lastHandle_;
-        handles_[number].origin = origin;
+        number = numbers_[origin] = lastHandle_;
+        handle = &handles_[number];
+        handle->origin = origin;
     }
-    Handle& handle = handles_[number];
-    ++handle.users;
-    const auto known = findReceived(handle, *link);
-    if (known != handle.received.end()) {
+    ++handle->users;
+    const auto known = findReceived(*handle, *link);
+    if (known != handle->received.end()) {
         ++known->count;
     } else {
-        handle.received.push_back({link, 1});
+        handle->received.push_back({link, 1});
         peers_[link.get()].handles.insert(number);
     }
     return number;
@@ -76,10 +88,11 @@ int32_t References::adopt(const std::shared_ptr<Link>& link, uint64_t node) {
 
 int32_t References::share(const Identity& owner, uint64_t node) {
     const std::lock_guard<std::mutex> lock(mutex_);
-    const auto number = numbers_.find({owner, node});
-    if (number == numbers_.end()) return 0;
-    ++handles_[number->second].users;
-    return number->second;
+    int32_t number = 0;
+    Handle* handle = findUsable({owner, node}, nullptr, number);
+    if (handle == nullptr) return 0;
+    ++handle->users;
+    return number;
 }
 
 void References::acquire(int32_t number) {
@@ -106,7 +119,8 @@ void References::release(int32_t number) {
         if (handle == handles_.end() || --handle->second.users > 0) return;
         dropped = std::move(handle->second);
         handles_.erase(handle);
-        numbers_.erase(dropped.origin);
+        const auto known = numbers_.find(dropped.origin);
+        if (known != numbers_.end() && known->second == number) numbers_.erase(known);
         for (const Received& received : dropped.received) {
             peers_[received.link.get()].handles.erase(number);
             if (forgetPeerIfEmpty(*received.link)) over.push_back(received.link);

@@ -88,6 +88,7 @@ private:
         std::unordered_set<int32_t> handles;       // received from the peer
     };
 
+    Handle* findUsable(const std::pair<Identity, uint64_t>& origin, const Link* link, int32_t& number);
     void dropGift(const Gift& gift);
     // True when that was all, and the link was there for nothing else.
     bool forgetPeerIfEmpty(const Link& link);

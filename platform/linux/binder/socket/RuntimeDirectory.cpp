@@ -15,6 +15,8 @@
 #include <cstring>
 #include <memory>
 
+#include "Frame.h"
+
 namespace android::socket_driver {
 namespace {
 
@@ -123,6 +125,7 @@ status_t RuntimeDirectory::connect(const std::string& name, Found& found) const 
     found.file = {status.st_dev, status.st_ino};
     UniqueFd fd(socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0));
     if (!fd.valid()) return -errno;
+    limitWaits(fd.get());
     if (!connectTo(fd.get(), found.path.get())) return errno == ECONNREFUSED ? NAME_NOT_FOUND : -errno;
     found.connection = std::move(fd);
     return OK;

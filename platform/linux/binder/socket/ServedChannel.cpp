@@ -79,7 +79,7 @@ bool ServedChannel::sendUnsent() {
 void ServedChannel::mute() {
     if (muted_) return;
     muted_ = true;
-    poller_.change(*this, 0);
+    poller_.change(*this, Poller::kEdge);
 }
 
 void ServedChannel::resume() {

@@ -65,6 +65,7 @@ private:
         kAnswered,
         kUnheard,  // the channel was closed before anything came
         kLost,     // the channel was closed, or the peer misbehaved
+        kSilent,   // nothing came in the time there was
     };
 
     // LinkEvents

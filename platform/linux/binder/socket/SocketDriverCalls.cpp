@@ -76,7 +76,7 @@ status_t SocketDriver::callOnChannel(const std::shared_ptr<Link>& link, Purpose 
                     return status;
                 }
                 isRefused = outcome == Outcome::kUnheard && channel.isFresh();
-                status = DEAD_OBJECT;
+                status = outcome == Outcome::kSilent ? TIMED_OUT : DEAD_OBJECT;
             }
         }
         if (isRefused) status = link->heedRefusal();
@@ -127,6 +127,7 @@ SocketDriver::Outcome SocketDriver::exchange(const std::shared_ptr<Link>& link, 
         answered.clear();
         if (result == FrameReader::Result::kReceipt) continue;
         if (result == FrameReader::Result::kClosed && !heard) return Outcome::kUnheard;
+        if (result == FrameReader::Result::kAgain) return Outcome::kSilent;
         if (result != FrameReader::Result::kFrame) return Outcome::kLost;
         if (frame.header.type == FrameType::kReply) {
             status = takeReply(link, channel, frame, reply);

@@ -81,6 +81,10 @@ void SocketDriver::linkEnded(const std::shared_ptr<Link>& link) {
     }
     directory_.forget(link);
     house_.remove(link->id);
+    errands_->drop(*link);
+    if (auto orphans = std::make_shared<std::vector<AsyncCall>>(asyncCalls_.orphan(*link)); !orphans->empty()) {
+        errands_->push({[orphans = std::move(orphans)] {}, true});
+    }
 
     References::Estate estate = references_.end(*link);
     if (!estate.objects.empty()) errands_->push({[objects = std::move(estate.objects)] {}, true});

@@ -35,12 +35,14 @@ void SocketDriver::channelClosed(ServedChannel& channel) {
 }
 
 void SocketDriver::leaveToPool(Arrival arrival) {
+    const Link* link = arrival.channel->link().get();
     const auto shared = std::make_shared<Arrival>(std::move(arrival));
     errands_->push({[this, shared] {
-        if (shared->channel->link()->dead()) return;
-        serveArrival(*shared);
-        shared->channel->resume();
-    }});
+                        if (shared->channel->link()->dead()) return;
+                        serveArrival(*shared);
+                        shared->channel->resume();
+                    },
+                    false, link});
 }
 
 void SocketDriver::serveArrival(Arrival& arrival) {
@@ -148,12 +150,23 @@ bool SocketDriver::acceptOneway(Arrival& arrival) {
 }
 
 void SocketDriver::runOneway(const BBinder* target) {
+    // A program may end its thread in the middle of a call; the calls behind it are for another.
+    struct Unfinished {
+        SocketDriver& driver;
+        const BBinder* target;
+        ~Unfinished() {
+            if (target == nullptr) return;
+            driver.errands_->push({[this_driver = &driver, rest = target] { this_driver->runOneway(rest); }});
+        }
+    };
+    Unfinished unfinished{*this, target};
     asyncCalls_.run(target, [this](AsyncCall& call) {
         const RunningCalls::Call running(running_);
         const AsyncCall own = std::move(call);  // what it holds goes away while the call still counts
         Parcel reply;
         run(own.target, own.caller, own.header, *own.data, reply, nullptr);
     });
+    unfinished.target = nullptr;
 }
 
 // -- The directory
@@ -197,7 +210,7 @@ bool SocketDriver::serveLookUp(Arrival& arrival, const std::string& name) {
                         answerWith();
                         channel->resume();
                     },
-                    true});
+                    true, arrival.channel->link().get()});
     return false;
 }
 

@@ -21,7 +21,7 @@
 
 namespace android::socket_driver {
 
-constexpr uint32_t kMagic = 0x324b5342;  // "BSK2"
+constexpr uint32_t kMagic = 0x314b5342;  // "BSK1"
 
 enum class FrameType : uint32_t {
     kTransaction = 1,

@@ -169,6 +169,20 @@ TEST(SocketOneway, OfAClientThatDiesIsStillRun) {
     EXPECT_TRUE(eventually([&] { return appended(service).size() == 1; }));
 }
 
+TEST(SocketOneway, MayEndItsThread) {
+    const Process server = start_server();
+    const sp<IBinder> service = find_service();
+    Gate gate;
+    ASSERT_EQ(gate.call(service, IBinder::FLAG_ONEWAY), OK);
+    ASSERT_TRUE(gate.wait_for(1));
+    for (int32_t n = 0; n < 5; ++n) {
+        ASSERT_EQ(service->transact(TestService::kEndThread, Parcel(), nullptr, IBinder::FLAG_ONEWAY), OK);
+        ASSERT_EQ(append(service, n), OK);
+    }
+    gate.open();
+    EXPECT_TRUE(eventually([&] { return appended(service).size() == 5; })) << "others run those behind it";
+}
+
 TEST(SocketOneway, ReturnsWhatItBroughtAlong) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
