@@ -4,7 +4,7 @@
 
 #include <atomic>
 
-namespace android::socket_driver {
+namespace android {
 namespace {
 
 std::atomic<bool> g_forked{false};
@@ -17,4 +17,4 @@ void watchForForks() {
     pthread_atfork(nullptr, nullptr, [] { g_forked = true; });
 }
 
-}  // namespace android::socket_driver
+}  // namespace android

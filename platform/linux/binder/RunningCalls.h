@@ -6,7 +6,7 @@
 #include <mutex>
 #include <thread>
 
-namespace android::socket_driver {
+namespace android {
 
 // Static objects go away when a process exits, while the pool's threads are still there. So nothing new may
 // begin then, and what has begun is given a moment.
@@ -28,11 +28,12 @@ public:
         RunningCalls& calls_;
     };
 
-    // Waits for the calls of other threads, no longer than `limit`.
+    // Waits for the calls of other threads, no longer than `limit`. What the calling thread goes on to do, and what
+    // comes back to it then, is its own.
     void stop(std::chrono::milliseconds limit) {
         std::unique_lock<std::mutex> lock(mutex_);
         stopped_ = true;
-        const size_t own = depth() > 0 ? 1 : 0;
+        const size_t own = depth()++ > 0 ? 1 : 0;
         ended_.wait_for(lock, limit, [&] { return running_ <= own; });
     }
 
@@ -64,4 +65,4 @@ private:
     bool stopped_ = false;
 };
 
-}  // namespace android::socket_driver
+}  // namespace android
