@@ -160,7 +160,7 @@ INSTANTIATE_TEST_SUITE_P(TwoCpus, MessageQueueStream,
                                          Stream{409600, 1000, true, "default"}));
 
 // Sizes from the smallest to the largest that goes out in one atomic write.
-size_t small_size(uint64_t number) { return 16 + number * 37 % (4092 - 16 + 1); }
+size_t small_size(uint64_t number) { return static_cast<size_t>(16 + number * 37 % (4092 - 16 + 1)); }
 
 void fill_small(unsigned char* message, uint64_t writer, uint64_t number) {
     memcpy(message, &writer, sizeof writer);

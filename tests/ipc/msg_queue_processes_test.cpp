@@ -30,7 +30,7 @@ size_t mixed_size(uint32_t index) {
     return kSizes[index % std::size(kSizes)];
 }
 // In one atomic write, so that several senders may send them.
-size_t small_size(uint32_t index) { return index % 100 == 0 ? 4092 : 8 + mix(index) % 200; }
+size_t small_size(uint32_t index) { return index % 100 == 0 ? 4092 : 8 + static_cast<size_t>(mix(index) % 200); }
 
 // A message that says who sent it and which it is, and is otherwise as good as random.
 std::string message_of(uint32_t sender, uint32_t index, size_t size) {

@@ -263,8 +263,8 @@ TEST(ThreadHandle, WhereRunningThreadsCannotBeToldADetachedHandleCannotBeJoinedA
     bedside.wait_until_gone();
 }
 
-// Values that are nobody's handles, with a platform that takes them.
-pthread_t made_up(uintptr_t number) { return static_cast<pthread_t>(number << 32); }
+// Values that are nobody's handles, as addresses in the first page, with a platform that takes them.
+pthread_t made_up(uintptr_t number) { return static_cast<pthread_t>(number); }
 
 TEST(ThreadHandle, TheLatest1024JoinedHandlesAreRemembered) {
     static int touched;
