@@ -32,10 +32,12 @@ public:
 
     // The place where the next command will be.
     uint64_t mark() const { return consumed_ + bytes_.size(); }
-    // Takes back what was added since, as far as it has not been said.
-    void dropFrom(uint64_t mark) {
-        if (mark < consumed_ + bytes_.size())
-            bytes_.resize(mark > consumed_ ? static_cast<size_t>(mark - consumed_) : 0);
+    // Takes back the command that was added there, unless it has been said.
+    template <uint32_t code>
+    void takeBack(uint64_t mark) {
+        if (mark < consumed_) return;
+        const auto start = bytes_.begin() + static_cast<std::ptrdiff_t>(mark - consumed_);
+        bytes_.erase(start, start + static_cast<std::ptrdiff_t>(sizeof code + _IOC_SIZE(code)));
     }
     // So many bytes have been said.
     void consume(size_t size) {

@@ -44,6 +44,9 @@ struct Conversation {
     std::vector<BBinder*> strongReferences;
     std::vector<RefBase::weakref_type*> weakReferences;
 
+    // The kernel keeps objects until it hears that this process does.
+    bool owesAnswers = false;
+
     // Transactions that it runs, one inside the other.
     size_t depth = 0;
     // It belongs to the pool, and comes back to the kernel soon.

@@ -222,10 +222,11 @@ status_t KernelDriver::transact(int32_t handle, uint32_t code, const Parcel& dat
     bool isDead = false;
     status_t status = await(thread, oneway ? Outcome::kTaken : Outcome::kReply, reply, &isDead);
     // Its parcel is the caller's again.
-    thread.queue.dropFrom(mark);
+    thread.queue.takeBack<BC_TRANSACTION>(mark);
     if (isDead) handles_.markDead(handle);
     if (status == FAILED_TRANSACTION && handle != 0 && !handles_.isKnown(handle)) status = BAD_TYPE;
     settle(thread);
+    if (std::exchange(thread.owesAnswers, false)) flushUnlessSoon(thread);
     return status;
 }
 

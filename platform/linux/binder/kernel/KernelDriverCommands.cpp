@@ -66,7 +66,7 @@ public:
         thread_.queue.add<BC_REPLY>(answer);
         // Whatever became of it: the caller has been told by the kernel.
         driver_.await(thread_, Outcome::kTaken, nullptr);
-        thread_.queue.dropFrom(mark);
+        thread_.queue.takeBack<BC_REPLY>(mark);
     }
 
 private:
@@ -88,12 +88,14 @@ void KernelDriver::handle(Conversation& thread, const Command& command) {
             const auto object = command.payload<binder_ptr_cookie>();
             if (object.ptr != 0) pointer<RefBase::weakref_type>(object.ptr)->incWeak(this);
             thread.queue.add<BC_INCREFS_DONE>(object);
+            thread.owesAnswers = true;
             break;
         }
         case BR_ACQUIRE: {
             const auto object = command.payload<binder_ptr_cookie>();
             if (object.cookie != 0) pointer<BBinder>(object.cookie)->incStrong(this);
             thread.queue.add<BC_ACQUIRE_DONE>(object);
+            thread.owesAnswers = true;
             break;
         }
         case BR_RELEASE: {
