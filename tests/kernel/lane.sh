@@ -17,18 +17,15 @@ esac
 packages=$PWD/build/kernel/$architecture
 guest=$PWD/build/kernel/guest-$preset
 
-stop() {
-    kill "$(<"$guest/pid")" 2>/dev/null && flock -w 10 "$guest/running" true
-} || true
-
 cmake/sysroot.sh "$architecture" "$packages" "$kernel" busybox-static
-trap stop EXIT
+# The lock is free when the guest is gone.
+trap 'kill "$(<"$guest/pid")" 2>/dev/null && flock -w 10 "$guest/running" true || true' EXIT
 started=$SECONDS
 tests/kernel/boot.sh "$architecture" "$packages" "$root" "$PWD/build/$preset" "$guest"
 echo "The guest took $((SECONDS - started)) seconds to start $(<"$guest/version")."
 
 status=0
-TAVO_TEST_GUEST=$guest ctest --preset "$preset" --label-regex '^kernel$' --parallel "$(<"$guest/slots")" --progress "$@" || status=$?
+TAVO_TEST_GUEST=$guest ctest --preset "$preset" --label-regex '^kernel$' --parallel "$(<"$guest/slots")" "$@" || status=$?
 if flock --shared --nonblock "$guest/running" true; then
     echo "lane.sh: the guest ended before the tests did" >&2
     status=1
