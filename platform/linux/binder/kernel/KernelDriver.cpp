@@ -269,7 +269,7 @@ status_t KernelDriver::takeReply(const binder_transaction_data& transaction, Par
     Parcel unwanted;
     const bool isStatus = (transaction.flags & TF_STATUS_CODE) != 0;
     Parcel& target = reply != nullptr && !isStatus ? *reply : unwanted;
-    receive(transaction, target);
+    receive(transaction, target, releaseReply);
     if (!isStatus) return OK;
     int32_t status = OK;
     return unwanted.readInt32(&status) == OK ? status : status_t{FAILED_TRANSACTION};

@@ -2,6 +2,7 @@
 // platform's can call each other.
 #pragma once
 
+#include <binder/Parcel.h>
 #include <pthread.h>
 
 #include <atomic>
@@ -69,8 +70,10 @@ private:
 
     // What the kernel says
     void handle(Conversation& thread, const Command& command);
-    void receive(const binder_transaction_data& transaction, Parcel& parcel);
-    static void releaseBuffer(Parcel* parcel, const uint8_t* data, size_t size, const binder_size_t* objects,
+    void receive(const binder_transaction_data& transaction, Parcel& parcel, Parcel::release_func giveBack);
+    static void releaseReply(Parcel* parcel, const uint8_t* data, size_t size, const binder_size_t* objects,
+                             size_t count, void* driver);
+    static void releaseMemory(Parcel* parcel, const uint8_t* data, size_t size, const binder_size_t* objects,
                               size_t count, void* driver);
     void serve(Conversation& thread, const binder_transaction_data& transaction);
     status_t run(Conversation& thread, const binder_transaction_data& transaction, const Parcel& data, Parcel& reply);

@@ -5,6 +5,7 @@
 
 #include <cstring>
 #include <utility>
+#include <vector>
 
 #include "../Forked.h"
 #include "KernelDriver.h"
@@ -24,13 +25,16 @@ T* pointer(binder_uintptr_t value) {
     return reinterpret_cast<T*>(static_cast<uintptr_t>(value));
 }
 
-void closeDescriptors(const uint8_t* data, size_t size, const binder_size_t* objects, size_t count) {
+// The kernel opens descriptors for a process that receives some, and leaves it to close them.
+std::vector<UniqueFd> descriptorsIn(const uint8_t* data, size_t size, const binder_size_t* objects, size_t count) {
+    std::vector<UniqueFd> descriptors;
     for (size_t i = 0; i < count; ++i) {
         flat_binder_object object;
         if (objects[i] > size || size - objects[i] < sizeof object) continue;
         memcpy(&object, data + objects[i], sizeof object);
-        if (object.hdr.type == BINDER_TYPE_FD) close(static_cast<int>(object.handle));
+        if (object.hdr.type == BINDER_TYPE_FD) descriptors.emplace_back(static_cast<int>(object.handle));
     }
+    return descriptors;
 }
 
 }  // namespace
@@ -132,19 +136,25 @@ void KernelDriver::handle(Conversation& thread, const Command& command) {
     }
 }
 
-void KernelDriver::receive(const binder_transaction_data& transaction, Parcel& parcel) {
-    parcel.ipcSetDataReference(
-        pointer<const uint8_t>(transaction.data.ptr.buffer), static_cast<size_t>(transaction.data_size),
-        pointer<const binder_size_t>(transaction.data.ptr.offsets),
-        static_cast<size_t>(transaction.offsets_size / sizeof(binder_size_t)), releaseBuffer, this);
+void KernelDriver::receive(const binder_transaction_data& transaction, Parcel& parcel, Parcel::release_func giveBack) {
+    parcel.ipcSetDataReference(pointer<const uint8_t>(transaction.data.ptr.buffer),
+                               static_cast<size_t>(transaction.data_size),
+                               pointer<const binder_size_t>(transaction.data.ptr.offsets),
+                               static_cast<size_t>(transaction.offsets_size / sizeof(binder_size_t)), giveBack, this);
 }
 
-void KernelDriver::releaseBuffer(Parcel*, const uint8_t* data, size_t size, const binder_size_t* objects, size_t count,
-                                 void* driver) {
+void KernelDriver::releaseReply(Parcel* parcel, const uint8_t* data, size_t size, const binder_size_t* objects,
+                                size_t count, void* driver) {
     // The kernel does not let copies have the memory.
     if (isForked()) return;
+    descriptorsIn(data, size, objects, count).clear();
+    releaseMemory(parcel, data, size, objects, count, driver);
+}
+
+void KernelDriver::releaseMemory(Parcel*, const uint8_t* data, size_t size, const binder_size_t*, size_t count,
+                                 void* driver) {
+    if (isForked()) return;
     auto& self = *static_cast<KernelDriver*>(driver);
-    closeDescriptors(data, size, objects, count);
     Conversation& thread = self.self();
     thread.queue.add<BC_FREE_BUFFER>(binder_uintptr_t{reinterpret_cast<uintptr_t>(data)});
     // As long as the kernel has it, others' objects in it are held.
@@ -154,10 +164,15 @@ void KernelDriver::releaseBuffer(Parcel*, const uint8_t* data, size_t size, cons
 void KernelDriver::serve(Conversation& thread, const binder_transaction_data& transaction) {
     const RunningCalls::Call running(running_);
     Parcel data;
-    receive(transaction, data);
+    receive(transaction, data, releaseMemory);
+    // The reply may hold descriptors that came with the request.
+    const std::vector<UniqueFd> descriptors = descriptorsIn(
+        data.data(), data.dataSize(), reinterpret_cast<const binder_size_t*>(data.ipcObjects()), data.objectsCount());
     Answer answer(*this, thread, (transaction.flags & TF_ONE_WAY) == 0);
     Parcel reply;
     const status_t status = run(thread, transaction, data, reply);
+    // Before the caller, once it has its reply, sends as much again.
+    data.freeData();
     answer.send(status, reply);
 }
 

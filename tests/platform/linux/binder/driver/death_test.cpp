@@ -25,7 +25,7 @@ public:
     wp<IBinder> last;
 };
 
-TEST(SocketDeath, EndsTheCallsOfAKilledServer) {
+TEST(DriverDeath, EndsTheCallsOfAKilledServer) {
     Process server = start_server();
     const sp<IBinder> service = find_service();
     Gate gate;
@@ -42,7 +42,7 @@ TEST(SocketDeath, EndsTheCallsOfAKilledServer) {
     EXPECT_EQ(service->pingBinder(), DEAD_OBJECT);
 }
 
-TEST(SocketDeath, EndsACallThatIsNotReadYet) {
+TEST(DriverDeath, EndsACallThatIsNotReadYet) {
     Process server = start_server();
     const sp<IBinder> service = find_service();
     server.stop();
@@ -58,7 +58,7 @@ TEST(SocketDeath, EndsACallThatIsNotReadYet) {
     large.join();
 }
 
-TEST(SocketDeath, IsTheAnswerToAnyLaterCall) {
+TEST(DriverDeath, IsTheAnswerToAnyLaterCall) {
     Process server = start_server();
     const sp<IBinder> service = find_service(), unused = ask_for_object(service, TestService::kKept);
     EXPECT_EQ(ask(service, TestService::kThreadId) > 0, true);
@@ -68,7 +68,7 @@ TEST(SocketDeath, IsTheAnswerToAnyLaterCall) {
     EXPECT_EQ(service->pingBinder(), DEAD_OBJECT);
 }
 
-TEST(SocketDeath, IsToldToEveryRecipientOnce) {
+TEST(DriverDeath, IsToldToEveryRecipientOnce) {
     start_pool();
     Process server = start_server();
     const sp<IBinder> service = find_service();
@@ -87,7 +87,7 @@ TEST(SocketDeath, IsToldToEveryRecipientOnce) {
     EXPECT_EQ(gone->deaths, 0);
 }
 
-TEST(SocketDeath, IsToldWhileCallsAreUnderWay) {
+TEST(DriverDeath, IsToldWhileCallsAreUnderWay) {
     start_pool();
     for (int i = 0; i < 10; ++i) {
         Process server = start_server();
@@ -108,7 +108,7 @@ TEST(SocketDeath, IsToldWhileCallsAreUnderWay) {
     }
 }
 
-TEST(SocketDeath, CannotBeAskedForAfterwards) {
+TEST(DriverDeath, CannotBeAskedForAfterwards) {
     Process server = start_server();
     const sp<IBinder> service = find_service();
     server.kill(SIGKILL);
@@ -117,7 +117,7 @@ TEST(SocketDeath, CannotBeAskedForAfterwards) {
     EXPECT_EQ(service->linkToDeath(new Recipient), DEAD_OBJECT);
 }
 
-TEST(SocketDeath, LeavesTheNameToWhoComesNext) {
+TEST(DriverDeath, LeavesTheNameToWhoComesNext) {
     Process server = start_server();
     const sp<IBinder> service = find_service();
     server.kill(SIGKILL);
@@ -134,7 +134,7 @@ TEST(SocketDeath, LeavesTheNameToWhoComesNext) {
     EXPECT_EQ(defaultServiceManager()->listServices().size(), 1U);
 }
 
-TEST(SocketDeath, OfAClientIsToldToTheServer) {
+TEST(DriverDeath, OfAClientIsToldToTheServer) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     Process client = Process::start("keeps_object");
@@ -154,7 +154,7 @@ TEST_ROLE(keeps_object) {
 }
 
 // Clients that die in a call, having passed an object and descriptors along.
-TEST(SocketDeath, OfClientsLeavesNothingBehind) {
+TEST(DriverDeath, OfClientsLeavesNothingBehind) {
     constexpr int kClients = kSanitized ? 96 : 992;
     constexpr int kAtOnce = 16;
     const Process server = start_server();

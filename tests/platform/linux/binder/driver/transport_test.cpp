@@ -13,8 +13,11 @@ namespace {
 using namespace android;
 using namespace tavo::test;
 
-constexpr size_t kLimit = 1024 * 1024;
-constexpr int kMostDescriptors = 253;
+// The kernel's driver carries as much as it has mapped.
+size_t limit() {
+    const size_t most = 1024 * 1024;
+    return is_kernel_driver() ? most - 2 * static_cast<size_t>(sysconf(_SC_PAGESIZE)) : most;
+}
 
 bool same_file(int one, int other) {
     struct stat a {
@@ -22,7 +25,7 @@ bool same_file(int one, int other) {
     return fstat(one, &a) == 0 && fstat(other, &b) == 0 && a.st_dev == b.st_dev && a.st_ino == b.st_ino;
 }
 
-class SocketTransport : public testing::Test {
+class DriverTransport : public testing::Test {
 protected:
     status_t echo(const Parcel& data, Parcel* reply) { return service_->transact(TestService::kEcho, data, reply); }
     status_t reply_descriptor(int descriptor, size_t size, Parcel* reply) {
@@ -38,7 +41,7 @@ protected:
     const sp<IBinder> service_ = find_service();
 };
 
-TEST_F(SocketTransport, PassesDescriptors) {
+TEST_F(DriverTransport, PassesDescriptors) {
     Parcel reply;
     ASSERT_EQ(service_->transact(TestService::kOpenPipe, Parcel(), &reply), OK);
     const int from = reply.readFileDescriptor(), to = reply.readFileDescriptor();
@@ -52,7 +55,7 @@ TEST_F(SocketTransport, PassesDescriptors) {
     EXPECT_EQ(fcntl(to, F_GETFD), FD_CLOEXEC);
 }
 
-TEST_F(SocketTransport, ClosesDescriptorsWithTheParcel) {
+TEST_F(DriverTransport, ClosesDescriptorsWithTheParcel) {
     EXPECT_EQ(service_->pingBinder(), OK);
     const size_t here = count_descriptors(), there = count_descriptors(server_.pid());
     {
@@ -64,17 +67,7 @@ TEST_F(SocketTransport, ClosesDescriptorsWithTheParcel) {
     EXPECT_TRUE(eventually([&] { return count_descriptors(server_.pid()) == there; }));
 }
 
-TEST_F(SocketTransport, PassesAsManyDescriptorsAsTheKernel) {
-    Parcel data, reply;
-    for (int i = 0; i < kMostDescriptors; ++i) data.writeFileDescriptor(STDIN_FILENO);
-    ASSERT_EQ(echo(data, &reply), OK);
-    for (int i = 0; i < kMostDescriptors; ++i) EXPECT_TRUE(same_file(reply.readFileDescriptor(), STDIN_FILENO));
-    data.writeFileDescriptor(STDIN_FILENO);
-    EXPECT_EQ(echo(data, &reply), FAILED_TRANSACTION);
-    EXPECT_EQ(service_->pingBinder(), OK);
-}
-
-TEST_F(SocketTransport, PassesDescriptorsWithParcelsOfAnySize) {
+TEST_F(DriverTransport, PassesDescriptorsWithParcelsOfAnySize) {
     for (const size_t size : {0U, 100U, 3900U, 4000U, 4096U, 5000U, 20000U, 300000U, 1000000U}) {
         Parcel data, reply;
         data.setDataSize(size & ~3U);
@@ -86,7 +79,7 @@ TEST_F(SocketTransport, PassesDescriptorsWithParcelsOfAnySize) {
     }
 }
 
-TEST_F(SocketTransport, RefusesDescriptorsThatAreNotOpen) {
+TEST_F(DriverTransport, RefusesDescriptorsThatAreNotOpen) {
     for (const size_t size : {0U, 100000U}) {
         for (const int descriptor : {-1, kClosed}) {
             Parcel data, reply;
@@ -104,7 +97,7 @@ TEST_F(SocketTransport, RefusesDescriptorsThatAreNotOpen) {
     EXPECT_EQ(reply_descriptor(STDIN_FILENO, 0, &reply), OK) << "and goes on";
 }
 
-TEST_F(SocketTransport, GivesBackTheObjectsOfRefusedParcels) {
+TEST_F(DriverTransport, GivesBackTheObjectsOfRefusedParcels) {
     start_pool();
     for (const size_t size : {0U, 100000U}) {
         for (const int descriptor : {-1, kClosed}) {
@@ -119,27 +112,27 @@ TEST_F(SocketTransport, GivesBackTheObjectsOfRefusedParcels) {
     EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
 }
 
-TEST_F(SocketTransport, CarriesUpToALimitEitherWay) {
+TEST_F(DriverTransport, CarriesUpToALimitEitherWay) {
     Parcel data, reply;
-    std::vector<uint8_t> bytes(kLimit);
+    std::vector<uint8_t> bytes(limit());
     for (size_t i = 0; i < bytes.size(); ++i) bytes[i] = static_cast<uint8_t>(i * 7 + i / 256);
     data.write(bytes.data(), bytes.size());
-    ASSERT_EQ(data.dataSize(), kLimit);
+    ASSERT_EQ(data.dataSize(), limit());
     ASSERT_EQ(echo(data, &reply), OK);
-    ASSERT_EQ(reply.dataSize(), kLimit);
-    EXPECT_EQ(memcmp(reply.data(), bytes.data(), kLimit), 0);
+    ASSERT_EQ(reply.dataSize(), limit());
+    EXPECT_EQ(memcmp(reply.data(), bytes.data(), limit()), 0);
 
     data.writeInt32(1);
     EXPECT_EQ(echo(data, &reply), FAILED_TRANSACTION);
     EXPECT_EQ(reply.dataSize(), 0U);
     Parcel size;
-    size.writeInt32(kLimit + 4);
+    size.writeInt32(static_cast<int32_t>(limit() + 4));
     EXPECT_EQ(service_->transact(TestService::kBytes, size, &reply), FAILED_TRANSACTION);
     EXPECT_EQ(reply.dataSize(), 0U);
     EXPECT_EQ(service_->pingBinder(), OK);
 }
 
-TEST_F(SocketTransport, CarriesSizesOfAllKinds) {
+TEST_F(DriverTransport, CarriesSizesOfAllKinds) {
     for (int32_t size = 0; size < 10000; size += size < 300 ? 1 : 97) {
         Parcel data, reply;
         data.writeInt32(size);
@@ -148,11 +141,12 @@ TEST_F(SocketTransport, CarriesSizesOfAllKinds) {
     }
 }
 
-TEST_F(SocketTransport, CarriesMuchForManyAtOnce) {
+TEST_F(DriverTransport, CarriesMuchForManyAtOnce) {
     std::vector<std::thread> threads;
     for (int i = 0; i < 8; ++i) {
         threads.emplace_back([&, i] {
-            std::vector<uint8_t> bytes(500000, static_cast<uint8_t>(i));
+            // The kernel's driver has room for so much altogether.
+            std::vector<uint8_t> bytes(is_kernel_driver() ? 100000 : 500000, static_cast<uint8_t>(i));
             for (int n = 0; n < 5; ++n) {
                 Parcel data, reply;
                 data.write(bytes.data(), bytes.size());

@@ -27,7 +27,7 @@ std::vector<int32_t> appended(const sp<IBinder>& service) {
     return numbers;
 }
 
-TEST(SocketOneway, ReturnsBeforeTheCallRan) {
+TEST(DriverOneway, ReturnsBeforeTheCallRan) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     const auto start = steady_clock::now();
@@ -37,7 +37,7 @@ TEST(SocketOneway, ReturnsBeforeTheCallRan) {
     EXPECT_TRUE(eventually([&] { return appended(service).size() == 1; }));
 }
 
-TEST(SocketOneway, RunsInOrderOneAtATime) {
+TEST(DriverOneway, RunsInOrderOneAtATime) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     std::vector<int32_t> expected;
@@ -50,7 +50,7 @@ TEST(SocketOneway, RunsInOrderOneAtATime) {
     EXPECT_EQ(appended(service), expected);
 }
 
-TEST(SocketOneway, OfSeveralClientsIsRunOneAtATime) {
+TEST(DriverOneway, OfSeveralClientsIsRunOneAtATime) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     std::vector<std::thread> threads;
@@ -65,7 +65,7 @@ TEST(SocketOneway, OfSeveralClientsIsRunOneAtATime) {
     for (const int32_t number : appended(service)) EXPECT_EQ(number % 1000, next[static_cast<size_t>(number / 1000)]++);
 }
 
-TEST(SocketOneway, HoldsUpNobodyElse) {
+TEST(DriverOneway, HoldsUpNobodyElse) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     Gate gate;
@@ -78,7 +78,7 @@ TEST(SocketOneway, HoldsUpNobodyElse) {
     EXPECT_TRUE(eventually([&] { return appended(service).size() == 1; }));
 }
 
-TEST(SocketOneway, IsAcceptedWhileAllThreadsAreBusy) {
+TEST(DriverOneway, IsAcceptedWhileAllThreadsAreBusy) {
     const Process server = start_server("test.service", 1);
     const sp<IBinder> service = find_service();
     Gate gate;
@@ -93,7 +93,7 @@ TEST(SocketOneway, IsAcceptedWhileAllThreadsAreBusy) {
     EXPECT_TRUE(eventually([&] { return appended(service).size() == 10; }));
 }
 
-TEST(SocketOneway, IsAcceptedByAProcessWithoutAPool) {
+TEST(DriverOneway, IsAcceptedByAProcessWithoutAPool) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     const sp<TestService> own = new TestService;
@@ -112,7 +112,7 @@ TEST_ROLE(appends_to_kept) {
     return kept != nullptr && append(kept, 5) == OK ? 0 : 1;
 }
 
-TEST(SocketOneway, IsRefusedWhenTooMuchWaits) {
+TEST(DriverOneway, IsRefusedWhenTooMuchWaits) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     Gate gate;
@@ -140,16 +140,7 @@ TEST(SocketOneway, IsRefusedWhenTooMuchWaits) {
 
 TEST_ROLE(appends_once) { return append(find_service(), 1) == OK ? 0 : 1; }
 
-TEST(SocketOneway, OfAnySizeIsAcceptedAlone) {
-    const Process server = start_server();
-    const sp<IBinder> service = find_service();
-    Parcel data;
-    data.setDataSize(1024 * 1024);
-    EXPECT_EQ(service->transact(TestService::kAppend, data, nullptr, IBinder::FLAG_ONEWAY), OK);
-    EXPECT_TRUE(eventually([&] { return appended(service).size() == 1; }));
-}
-
-TEST(SocketOneway, ToADeadObjectFails) {
+TEST(DriverOneway, ToADeadObjectFails) {
     Process server = start_server();
     const sp<IBinder> service = find_service();
     server.kill(SIGKILL);
@@ -157,7 +148,7 @@ TEST(SocketOneway, ToADeadObjectFails) {
     EXPECT_EQ(append(service, 1), DEAD_OBJECT);
 }
 
-TEST(SocketOneway, OfAClientThatDiesIsStillRun) {
+TEST(DriverOneway, OfAClientThatDiesIsStillRun) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     Gate gate;
@@ -169,7 +160,7 @@ TEST(SocketOneway, OfAClientThatDiesIsStillRun) {
     EXPECT_TRUE(eventually([&] { return appended(service).size() == 1; }));
 }
 
-TEST(SocketOneway, MayEndItsThread) {
+TEST(DriverOneway, MayEndItsThread) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     Gate gate;
@@ -183,7 +174,7 @@ TEST(SocketOneway, MayEndItsThread) {
     EXPECT_TRUE(eventually([&] { return appended(service).size() == 5; })) << "others run those behind it";
 }
 
-TEST(SocketOneway, ReturnsWhatItBroughtAlong) {
+TEST(DriverOneway, ReturnsWhatItBroughtAlong) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     start_pool();

@@ -30,17 +30,17 @@ int32_t relay(uint32_t code, const std::vector<sp<IBinder>>& objects) {
     return ask(objects[0], TestService::kRelay, data);
 }
 
-TEST(SocketNesting, CallsBackOnTheThreadThatWaits) {
+TEST(DriverNesting, CallsBackOnTheThreadThatWaits) {
     const Process server = start_server();
     EXPECT_EQ(relay(TestService::kThreadId, {find_service(), new TestService}), gettid());
 }
 
-TEST(SocketNesting, GoesDeep) {
+TEST(DriverNesting, GoesDeep) {
     const Process server = start_server();
     EXPECT_EQ(ping_pong(find_service(), 100), 100);
 }
 
-TEST(SocketNesting, EndsBeforeTheStackDoes) {
+TEST(DriverNesting, EndsBeforeTheStackDoes) {
     const Process server = start_server();
     status_t status = OK;
     ping_pong(find_service(), 100000, &status);
@@ -48,14 +48,14 @@ TEST(SocketNesting, EndsBeforeTheStackDoes) {
     EXPECT_EQ(ping_pong(find_service(), 10), 10) << "the server goes on";
 }
 
-TEST(SocketNesting, ComesBackByWayOfAnother) {
+TEST(DriverNesting, ComesBackByWayOfAnother) {
     const Process b = start_server("b"), c = start_server("c");
     const sp<IBinder> own = new TestService;
     EXPECT_EQ(relay(TestService::kThreadId, {find_service("b"), find_service("c"), own}), gettid())
         << "to the thread that waits, in a process without a pool";
 }
 
-TEST(SocketNesting, ComesBackToServersByWayOfOthers) {
+TEST(DriverNesting, ComesBackToServersByWayOfOthers) {
     const Process b = start_server("b"), c = start_server("c");
     const sp<IBinder> own = new TestService, first = find_service("b"), second = find_service("c");
     std::vector<sp<IBinder>> objects;
@@ -63,7 +63,7 @@ TEST(SocketNesting, ComesBackToServersByWayOfOthers) {
     EXPECT_EQ(relay(TestService::kThreadId, objects), gettid());
 }
 
-TEST(SocketNesting, FindsAWayWhenEveryThreadIsBusy) {
+TEST(DriverNesting, FindsAWayWhenEveryThreadIsBusy) {
     const Process b = start_server("b", 1), c = start_server("c", 1);
     const sp<IBinder> own = new TestService, first = find_service("b"), second = find_service("c");
     start_pool(1);
@@ -94,7 +94,7 @@ TEST_ROLE(holds_up_kept) {
 }
 
 // Chains that all need the same few threads, and come back to servers whose threads are all part of a chain.
-TEST(SocketNesting, DoesNotLockUpUnderManyChains) {
+TEST(DriverNesting, DoesNotLockUpUnderManyChains) {
     const Process b = start_server("b", 2), c = start_server("c", 2);
     const sp<IBinder> first = find_service("b"), second = find_service("c");
     start_pool(2);
@@ -110,7 +110,7 @@ TEST(SocketNesting, DoesNotLockUpUnderManyChains) {
     for (std::thread& thread : threads) thread.join();
 }
 
-TEST(SocketNesting, LeavesUnrelatedCallsToThePool) {
+TEST(DriverNesting, LeavesUnrelatedCallsToThePool) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     const sp<TestService> own = new TestService;

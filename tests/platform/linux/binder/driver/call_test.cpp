@@ -45,7 +45,7 @@ size_t pool_size(pid_t server) {
     return count_threads_named(server, "Binder_") - count_threads_named(server, "Binder_house");
 }
 
-TEST(SocketCall, ReachesAnotherProcess) {
+TEST(DriverCall, ReachesAnotherProcess) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     ASSERT_NE(service, nullptr);
@@ -55,7 +55,7 @@ TEST(SocketCall, ReachesAnotherProcess) {
     EXPECT_TRUE(service->isBinderAlive());
 }
 
-TEST(SocketCall, ReturnsTheStatusOfTheObject) {
+TEST(DriverCall, ReturnsTheStatusOfTheObject) {
     const Process server = start_server();
     Parcel reply;
     EXPECT_EQ(find_service()->transact(12345, Parcel(), &reply), UNKNOWN_TRANSACTION);
@@ -63,7 +63,7 @@ TEST(SocketCall, ReturnsTheStatusOfTheObject) {
     EXPECT_EQ(find_service()->transact(TestService::kEcho, Parcel(), nullptr), OK) << "nobody wants the reply";
 }
 
-TEST(SocketCall, LeavesAnEmptyReplyEmpty) {
+TEST(DriverCall, LeavesAnEmptyReplyEmpty) {
     const Process server = start_server();
     Parcel reply;
     reply.writeInt32(1);
@@ -71,7 +71,7 @@ TEST(SocketCall, LeavesAnEmptyReplyEmpty) {
     EXPECT_EQ(reply.dataSize(), 0U) << "of the parcel's earlier contents nothing is left";
 }
 
-TEST(SocketCall, WorksFromManyThreadsAtOnce) {
+TEST(DriverCall, WorksFromManyThreadsAtOnce) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     std::vector<std::thread> threads;
@@ -91,7 +91,7 @@ TEST_ROLE(caller) {
     return 0;
 }
 
-TEST(SocketCall, WorksFromSixtyFourProcessesAtOnce) {
+TEST(DriverCall, WorksFromSixtyFourProcessesAtOnce) {
     const Process server = start_server();
     std::vector<Process> callers;
     for (int i = 0; i < 64; ++i) callers.push_back(Process::start("caller"));
@@ -99,7 +99,7 @@ TEST(SocketCall, WorksFromSixtyFourProcessesAtOnce) {
 }
 
 // Those that were asked for, the first thread of the pool, and the one that joined on its own.
-TEST(SocketCall, GetsAThreadOfItsOwnUpToTheMaximum) {
+TEST(DriverCall, GetsAThreadOfItsOwnUpToTheMaximum) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     const BlockedCallers callers(service, 40);
@@ -109,7 +109,7 @@ TEST(SocketCall, GetsAThreadOfItsOwnUpToTheMaximum) {
     EXPECT_EQ(pool_size(server.pid()), 15U + 1U) << "the one that joined keeps its name";
 }
 
-TEST(SocketCall, KeepsToTheMaximumThatWasSet) {
+TEST(DriverCall, KeepsToTheMaximumThatWasSet) {
     const Process server = start_server("test.service", 3);
     const BlockedCallers callers(find_service(), 20);
     EXPECT_TRUE(callers.gate().wait_for(3 + 2));
@@ -117,14 +117,14 @@ TEST(SocketCall, KeepsToTheMaximumThatWasSet) {
     EXPECT_TRUE(callers.gate().is_quiet());
 }
 
-TEST(SocketCall, StartsNoThreadForOneCallerAtATime) {
+TEST(DriverCall, StartsNoThreadForOneCallerAtATime) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     for (int32_t n = 0; n < 200; ++n) EXPECT_TRUE(echoes(service, n));
     EXPECT_LE(pool_size(server.pid()), 2U) << "the first, and one that waits while it works";
 }
 
-TEST(SocketCall, IsServedAsSoonAsOneOfManyThreadsIsFree) {
+TEST(DriverCall, IsServedAsSoonAsOneOfManyThreadsIsFree) {
     const Process server = start_server("test.service", 1);
     const sp<IBinder> service = find_service();
     std::thread late;
@@ -137,7 +137,7 @@ TEST(SocketCall, IsServedAsSoonAsOneOfManyThreadsIsFree) {
     for (int32_t n = 0; n < 100; ++n) EXPECT_TRUE(echoes(service, n)) << "all is as before";
 }
 
-TEST(SocketCall, NamesAreServedWhileAllThreadsAreBusy) {
+TEST(DriverCall, NamesAreServedWhileAllThreadsAreBusy) {
     const Process server = start_server("test.service", 1);
     const sp<IBinder> service = find_service();
     const BlockedCallers callers(service, 3);
@@ -148,7 +148,7 @@ TEST(SocketCall, NamesAreServedWhileAllThreadsAreBusy) {
 
 TEST_ROLE(finder) { return find_service() != nullptr ? 0 : 1; }
 
-TEST(SocketCall, NeedsNoPoolToFindNames) {
+TEST(DriverCall, NeedsNoPoolToFindNames) {
     Process silent = Process::start("publisher_without_pool");
     EXPECT_EQ(silent.read_line(), "ready");
     EXPECT_NE(find_service("silent"), nullptr);
@@ -161,7 +161,7 @@ TEST_ROLE(publisher_without_pool) {
     return 0;
 }
 
-TEST(SocketCall, MayEndItsThread) {
+TEST(DriverCall, MayEndItsThread) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     for (int i = 0; i < 20; ++i) {

@@ -1,4 +1,4 @@
-// A service for tests of the socket driver, and processes that serve it.
+// A service for tests of what drivers have in common, and processes that serve it.
 #pragma once
 
 #include <binder/Binder.h>
@@ -24,6 +24,9 @@ constexpr bool kSanitized = true;
 #else
 constexpr bool kSanitized = false;
 #endif
+
+// Whether the tests run on the kernel's driver, with a service manager, and not on sockets.
+bool is_kernel_driver();
 
 class TestService : public android::BBinder {
 public:

@@ -12,7 +12,7 @@ using namespace android;
 using namespace tavo::test;
 
 // This process, and two others: b and c.
-class SocketIntroduction : public testing::Test {
+class DriverIntroduction : public testing::Test {
 protected:
     Process process_b_ = start_server("b");
     Process process_c_ = start_server("c");
@@ -20,7 +20,7 @@ protected:
     sp<IBinder> c_ = find_service("c");
 };
 
-TEST_F(SocketIntroduction, LetsTheReceiverCall) {
+TEST_F(DriverIntroduction, LetsTheReceiverCall) {
     ASSERT_EQ(ask(c_, TestService::kKeep, b_), 0);
     Parcel data;
     data.writeInt32(TestService::kThreadId);
@@ -29,14 +29,14 @@ TEST_F(SocketIntroduction, LetsTheReceiverCall) {
               0);
 }
 
-TEST_F(SocketIntroduction, TellsTheOwnerWhoCalls) {
+TEST_F(DriverIntroduction, TellsTheOwnerWhoCalls) {
     ASSERT_EQ(ask(c_, TestService::kKeep, b_), 0);
     Parcel data;
     data.writeInt32(TestService::kCallerIds);
     EXPECT_EQ(ask(c_, TestService::kCallKept, data), process_c_.pid());
 }
 
-TEST_F(SocketIntroduction, TellsTheObjectsOfTheIntroducerApartFromTheOwners) {
+TEST_F(DriverIntroduction, TellsTheObjectsOfTheIntroducerApartFromTheOwners) {
     start_pool();
     ASSERT_EQ(ask(c_, TestService::kKeep, new TestService), 0);
     Parcel data;
@@ -44,13 +44,13 @@ TEST_F(SocketIntroduction, TellsTheObjectsOfTheIntroducerApartFromTheOwners) {
     EXPECT_EQ(ask(c_, TestService::kCallKept, data), process_c_.pid());
 }
 
-TEST_F(SocketIntroduction, OfTheSameObjectAgainGivesTheSameProxy) {
+TEST_F(DriverIntroduction, OfTheSameObjectAgainGivesTheSameProxy) {
     ASSERT_EQ(ask(c_, TestService::kKeep, b_), 0);
     EXPECT_EQ(ask(c_, TestService::kIsKept, b_), 1);
     EXPECT_EQ(ask(c_, TestService::kIsKept, c_), 0);
 }
 
-TEST_F(SocketIntroduction, AndALookUpGiveTheSameProxy) {
+TEST_F(DriverIntroduction, AndALookUpGiveTheSameProxy) {
     ASSERT_EQ(ask(c_, TestService::kKeep, b_), 0);
     // c looks b's name up and is given what it found.
     Parcel data, reply;
@@ -62,7 +62,7 @@ TEST_F(SocketIntroduction, AndALookUpGiveTheSameProxy) {
     EXPECT_EQ(ask(c_, TestService::kIsKeptNamed, name), 1);
 }
 
-TEST_F(SocketIntroduction, AfterALookUpGivesTheSameProxy) {
+TEST_F(DriverIntroduction, AfterALookUpGivesTheSameProxy) {
     Parcel name;
     name.writeString16(String16("b"));
     ASSERT_EQ(ask(c_, TestService::kIsKeptNamed, name), 0) << "c knows b by name from here on";
@@ -70,7 +70,7 @@ TEST_F(SocketIntroduction, AfterALookUpGivesTheSameProxy) {
     EXPECT_EQ(ask(c_, TestService::kIsKeptNamed, name), 1);
 }
 
-TEST_F(SocketIntroduction, ToTheOwnerGivesTheObjectItself) {
+TEST_F(DriverIntroduction, ToTheOwnerGivesTheObjectItself) {
     start_pool();
     // Each of the two knows the other by name: what one is sent goes back along another connection than it came.
     const sp<IBinder> own = new TestService;
@@ -85,7 +85,7 @@ TEST_F(SocketIntroduction, ToTheOwnerGivesTheObjectItself) {
     EXPECT_EQ(ask_for_object(b_, TestService::kKept), own);
 }
 
-TEST_F(SocketIntroduction, GoesOnFromHandToHand) {
+TEST_F(DriverIntroduction, GoesOnFromHandToHand) {
     const Process process_d = start_server("d");
     const sp<IBinder> d = find_service("d");
     // b's object comes to d by way of this process and c.
@@ -98,7 +98,7 @@ TEST_F(SocketIntroduction, GoesOnFromHandToHand) {
     EXPECT_EQ(ask(d, TestService::kPingKept), OK) << "which does not depend on who passed it on";
 }
 
-TEST_F(SocketIntroduction, KeepsTheObjectAlive) {
+TEST_F(DriverIntroduction, KeepsTheObjectAlive) {
     start_pool();
     ASSERT_EQ(ask(b_, TestService::kKeep, new TestService), 0);
     {
@@ -116,7 +116,7 @@ TEST_F(SocketIntroduction, KeepsTheObjectAlive) {
     EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
 }
 
-TEST_F(SocketIntroduction, TellsOfTheOwnersDeath) {
+TEST_F(DriverIntroduction, TellsOfTheOwnersDeath) {
     ASSERT_EQ(ask(c_, TestService::kKeep, b_), 0);
     ASSERT_EQ(ask(c_, TestService::kWatchKept), OK);
     process_b_.kill(SIGKILL);
@@ -124,7 +124,7 @@ TEST_F(SocketIntroduction, TellsOfTheOwnersDeath) {
     EXPECT_EQ(ask(c_, TestService::kPingKept), DEAD_OBJECT);
 }
 
-TEST_F(SocketIntroduction, TellsOfADeathOnceWhenKnownTwice) {
+TEST_F(DriverIntroduction, TellsOfADeathOnceWhenKnownTwice) {
     ASSERT_EQ(ask(c_, TestService::kKeep, b_), 0);
     Parcel name;
     name.writeString16(String16("b"));
@@ -136,7 +136,7 @@ TEST_F(SocketIntroduction, TellsOfADeathOnceWhenKnownTwice) {
     EXPECT_EQ(ask(c_, TestService::kDeaths), 1);
 }
 
-TEST_F(SocketIntroduction, LeavesNoConnectionBehind) {
+TEST_F(DriverIntroduction, LeavesNoConnectionBehind) {
     const auto descriptors = [this] {
         return std::vector<size_t>{count_descriptors(), count_descriptors(process_b_.pid()),
                                    count_descriptors(process_c_.pid())};
@@ -157,7 +157,7 @@ TEST_F(SocketIntroduction, LeavesNoConnectionBehind) {
         << ", then " << testing::PrintToString(descriptors());
 }
 
-TEST_F(SocketIntroduction, OfManyObjectsAtOnceIsPossible) {
+TEST_F(DriverIntroduction, OfManyObjectsAtOnceIsPossible) {
     std::vector<Process> processes;
     Parcel data, reply;
     for (int i = 0; i < 8; ++i) {
@@ -170,7 +170,7 @@ TEST_F(SocketIntroduction, OfManyObjectsAtOnceIsPossible) {
     }
 }
 
-TEST_F(SocketIntroduction, RacesWithLookUpsAndEndings) {
+TEST_F(DriverIntroduction, RacesWithLookUpsAndEndings) {
     std::vector<std::thread> threads;
     for (int i = 0; i < 4; ++i) {
         threads.emplace_back([&] {

@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <fstream>
 #include <memory>
 #include <thread>
@@ -17,6 +18,11 @@
 namespace tavo::test {
 
 using namespace android;
+
+bool is_kernel_driver() {
+    const char* driver = getenv("BINDER_DRIVER");
+    return driver != nullptr && strcmp(driver, "kernel") == 0;
+}
 
 TestService::~TestService() { --count_; }
 

@@ -12,7 +12,7 @@ namespace {
 using namespace android;
 using namespace tavo::test;
 
-TEST(SocketObject, IsCalledByWhoKeepsIt) {
+TEST(DriverObject, IsCalledByWhoKeepsIt) {
     const Process server = start_server();
     const sp<IBinder> service = find_service(), own = new TestService;
     ASSERT_EQ(ask(service, TestService::kKeep, own), 0);
@@ -40,7 +40,7 @@ TEST_ROLE(calls_kept) {
     return 0;
 }
 
-TEST(SocketObject, IsItselfAgainAtHome) {
+TEST(DriverObject, IsItselfAgainAtHome) {
     const Process server = start_server();
     const sp<IBinder> service = find_service(), own = new TestService;
     ASSERT_EQ(ask(service, TestService::kKeep, own), 0);
@@ -51,7 +51,7 @@ TEST(SocketObject, IsItselfAgainAtHome) {
     EXPECT_EQ(find_service(), service);
 }
 
-TEST(SocketObject, MayBeNull) {
+TEST(DriverObject, MayBeNull) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     EXPECT_EQ(ask(service, TestService::kKeep, nullptr), 0);
@@ -59,7 +59,7 @@ TEST(SocketObject, MayBeNull) {
     EXPECT_EQ(ask(service, TestService::kIsKept, nullptr), 1);
 }
 
-TEST(SocketObject, GoesAwayWhenNobodyKeepsIt) {
+TEST(DriverObject, GoesAwayWhenNobodyKeepsIt) {
     start_pool();
     const Process server = start_server();
     const sp<IBinder> service = find_service();
@@ -70,15 +70,7 @@ TEST(SocketObject, GoesAwayWhenNobodyKeepsIt) {
     EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
 }
 
-TEST(SocketObject, GoesAwayWithThePoollessProcessesNextCall) {
-    const Process server = start_server();
-    const sp<IBinder> service = find_service();
-    ASSERT_EQ(ask(service, TestService::kKeep, new TestService), 0);
-    ASSERT_EQ(ask(service, TestService::kKeep, nullptr), 0);
-    EXPECT_TRUE(eventually([&] { return service->pingBinder() == OK && TestService::count() == 0; }));
-}
-
-TEST(SocketObject, GoesAwayWithItsLastHolder) {
+TEST(DriverObject, GoesAwayWithItsLastHolder) {
     start_pool();
     Process server = start_server();
     ASSERT_EQ(ask(find_service(), TestService::kKeep, new TestService), 0);
@@ -87,7 +79,7 @@ TEST(SocketObject, GoesAwayWithItsLastHolder) {
 }
 
 // The reply that gives it back races with the news that it is given up.
-TEST(SocketObject, SurvivesBeingGivenBackAndUpAtOnce) {
+TEST(DriverObject, SurvivesBeingGivenBackAndUpAtOnce) {
     start_pool();
     const Process server = start_server();
     const sp<IBinder> service = find_service();
@@ -114,7 +106,7 @@ TEST(SocketObject, SurvivesBeingGivenBackAndUpAtOnce) {
     EXPECT_EQ(service->pingBinder(), OK);
 }
 
-TEST(SocketObject, OfAServerIsGivenUpAndFoundAgain) {
+TEST(DriverObject, OfAServerIsGivenUpAndFoundAgain) {
     const Process server = start_server();
     std::vector<std::thread> threads;
     for (int i = 0; i < 4; ++i) {
@@ -131,7 +123,7 @@ TEST(SocketObject, OfAServerIsGivenUpAndFoundAgain) {
 }
 
 // A parcel full of objects: each is one of its own.
-TEST(SocketObject, MayBeOneOfThousands) {
+TEST(DriverObject, MayBeOneOfThousands) {
     start_pool();
     const Process server = start_server();
     const sp<IBinder> service = find_service();
@@ -149,7 +141,7 @@ TEST(SocketObject, MayBeOneOfThousands) {
     EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
 }
 
-TEST(SocketObject, MayBeDeadAlreadyWhenItIsPassedOn) {
+TEST(DriverObject, MayBeDeadAlreadyWhenItIsPassedOn) {
     const Process server = start_server();
     const sp<IBinder> service = find_service();
     sp<IBinder> dead;
