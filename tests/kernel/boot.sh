@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
 # Boots the kernel that cmake/sysroot.sh unpacked, in QEMU, and returns when the guest takes tests. It is ended after
-# ten minutes at the latest.
+# twenty minutes at the latest.
 #
 #   boot.sh ARCHITECTURE PACKAGES ROOT BUILD GUEST
 #
@@ -70,7 +70,7 @@ done
 
 exec {running}>"$guest/running"
 flock "$running"
-timeout --signal=KILL 600 "${arguments[@]}" </dev/null >"$guest/qemu" 2>&1 &
+timeout --signal=KILL 1200 "${arguments[@]}" </dev/null >"$guest/qemu" 2>&1 &
 echo $! >"$guest/pid"
 exec {running}>&-
 for ((slot = 0; slot < slots; ++slot)); do
