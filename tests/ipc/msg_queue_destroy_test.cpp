@@ -1,6 +1,12 @@
 // Giving queues back, in the server's own process.
+#include <sys/mman.h>
+
+#include <cstdint>
+#include <new>
+
 #include "ipc/descriptors.h"
 #include "ipc/msg_queue_test.h"
+#include "support/platform_fault.h"
 
 namespace {
 
@@ -9,14 +15,17 @@ using tavo::test::get;
 using tavo::test::is_open;
 using tavo::test::kEntered;
 using tavo::test::kExiting;
+using tavo::test::kLibrary;
 using tavo::test::kLookup;
 using tavo::test::kLookupBegins;
+using tavo::test::kOperatorNew;
 using tavo::test::kQueueTrace;
 using tavo::test::library_lines;
 using tavo::test::line;
 using tavo::test::Lines;
 using tavo::test::LogCapture;
 using tavo::test::logged_exactly;
+using tavo::test::PlatformHook;
 using tavo::test::put;
 using tavo::test::queue_of;
 
@@ -43,6 +52,34 @@ TEST_F(Destroy, LogsEveryStep) {
     EXPECT_EQ(tavo_msg_queue_destroy(handle), TAVO_SUCCESS);
     EXPECT_TRUE(
         logged_exactly(library_lines(log), Lines{kEntered} + kLookup + kQueueTrace + kQueueTrace + Lines{kExiting}));
+}
+
+// Where memory is handed out from the top of a 32-bit address space down, a queue lies in its upper half.
+constexpr size_t kBlockSize = 4096;
+void* g_high_block = MAP_FAILED;
+void* allocate_high(size_t size, const std::nothrow_t& tag) {
+    if (size != sizeof(android::TAVO_MessageQueue)) return operator new(size, tag);
+    g_high_block = mmap(reinterpret_cast<void*>(uintptr_t{0xA0000000}), kBlockSize, PROT_READ | PROT_WRITE,
+                        MAP_PRIVATE | MAP_ANONYMOUS | MAP_FIXED_NOREPLACE, -1, 0);
+    return g_high_block;
+}
+void free_high(void* block, size_t) {
+    if (block != g_high_block) return operator delete(block);
+    EXPECT_EQ(munmap(g_high_block, kBlockSize), 0);
+    g_high_block = MAP_FAILED;
+}
+
+TEST_F(Destroy, TakesBackAQueueInTheUpperHalfOf32BitAddresses) {
+    if (sizeof(void*) > 4) GTEST_SKIP() << "there are more addresses here";
+    const PlatformHook allocate(kLibrary, (std::string(kOperatorNew) + "RKSt9nothrow_t").c_str(), &allocate_high);
+    const PlatformHook release(kLibrary, "_ZdlPvj", &free_high);
+    const TAVO_INT64 handle = attached("7");
+    EXPECT_EQ(handle, 0xA0000000);
+    EXPECT_EQ(put(handle, "high"), TAVO_SUCCESS);
+    EXPECT_EQ(get(handle), "high");
+    EXPECT_EQ(tavo_msg_queue_destroy(handle), TAVO_SUCCESS);
+    EXPECT_EQ(g_high_block, MAP_FAILED) << "the queue is gone";
+    EXPECT_EQ(service_->get_fd(7), -1);
 }
 
 TEST_F(Destroy, RefusesHandlesThatAreNotPositive) {

@@ -6,6 +6,12 @@
 set -euo pipefail
 guest=$TAVO_TEST_GUEST
 
+expect_guest() {
+    flock --shared --nonblock "$guest/running" true || return 0
+    printf '\nin_guest.sh: the guest has ended: see %s\n' "$guest/console" >&2
+    exit 1
+}
+
 # A slot belongs to whoever holds its lock, so to nobody when its holder was killed.
 take_slot() {
     local lock
@@ -25,14 +31,18 @@ read_line() {
     line=
     until IFS= read -r -t 2 -u "$output" part; do
         line+=$part
-        kill -0 "$(<"$guest/pid")" 2>/dev/null || {
-            printf '\nin_guest.sh: the guest has ended: see %s\n' "$guest/console" >&2
-            exit 1
-        }
+        expect_guest
     done
     line+=$part
 }
 
+# Where the build is for another machine, the guest is that machine: it needs no emulator.
+if [[ $1 == env && $2 == TAVO_EMULATOR=* ]]; then
+    read -ra emulator <<<"${2#TAVO_EMULATOR=}"
+    shift $((2 + ${#emulator[@]}))
+fi
+
+expect_guest
 take_slot
 number=$$.${EPOCHREALTIME//[.,]/}
 exec {output}<>"$slot.out" {input}<>"$slot.in"

@@ -12,9 +12,13 @@
 #pragma once
 
 #include <cstddef>
+#include <type_traits>
 #include <vector>
 
 namespace tavo::test {
+
+// What operator new(size_t) is called in the symbol table, by the type that size_t is.
+inline constexpr const char* kOperatorNew = std::is_same_v<size_t, unsigned long> ? "_Znwm" : "_Znwj";
 
 class PlatformHook {
 public:
