@@ -37,9 +37,10 @@ FakeBinderDevice& FakeBinderDevice::install() {
     setenv("BINDER_DEVICE", kPath, 1);
     // For the rest of the process, which uses it until it has exited.
     g_device = new FakeBinderDevice;
-    new PlatformHook("libbinder.so", "open", &FakeBinderDevice::open);
-    new PlatformHook("libbinder.so", "ioctl", &FakeBinderDevice::ioctl);
-    new PlatformHook("libbinder.so", "mmap", &FakeBinderDevice::mmap);
+    static const PlatformHook& open = *new PlatformHook("libbinder.so", "open", &FakeBinderDevice::open);
+    static const PlatformHook& ioctl = *new PlatformHook("libbinder.so", "ioctl", &FakeBinderDevice::ioctl);
+    static const PlatformHook& mmap = *new PlatformHook("libbinder.so", "mmap", &FakeBinderDevice::mmap);
+    static_cast<void>(open), static_cast<void>(ioctl), static_cast<void>(mmap);
     return *g_device;
 }
 

@@ -21,12 +21,12 @@ public:
     template <uint32_t code>
     void add() {
         static_assert(_IOC_SIZE(code) == 0, "it has a payload");
-        append(&kCode<code>, sizeof code);
+        append(&kCode<code>, kCodeSize);
     }
     template <uint32_t code, typename T>
     void add(const T& payload) {
         static_assert(_IOC_SIZE(code) == sizeof payload, "it has another payload");
-        append(&kCode<code>, sizeof code);
+        append(&kCode<code>, kCodeSize);
         append(&payload, sizeof payload);
     }
 
@@ -37,7 +37,7 @@ public:
     void takeBack(uint64_t mark) {
         if (mark < consumed_) return;
         const auto start = bytes_.begin() + static_cast<std::ptrdiff_t>(mark - consumed_);
-        bytes_.erase(start, start + static_cast<std::ptrdiff_t>(sizeof code + _IOC_SIZE(code)));
+        bytes_.erase(start, start + static_cast<std::ptrdiff_t>(kCodeSize + _IOC_SIZE(code)));
     }
     // So many bytes have been said.
     void consume(size_t size) {
@@ -47,6 +47,7 @@ public:
     }
 
 private:
+    static constexpr size_t kCodeSize = sizeof(uint32_t);
     template <uint32_t code>
     static constexpr uint32_t kCode = code;
 

@@ -58,7 +58,8 @@ int main(int argc, char** argv) {
     sigprocmask(SIG_BLOCK, &ends, nullptr);
 
     // No other driver needs one.
-    setenv("BINDER_DRIVER", "kernel", 0);
+    const char* driver = getenv("BINDER_DRIVER");
+    if (driver == nullptr || *driver == '\0') setenv("BINDER_DRIVER", "kernel", 1);
     const status_t status = ProcessState::self()->becomeContextManager(new ServiceRegistry);
     if (status != OK) {
         complain(describe(status));
