@@ -155,7 +155,7 @@ TEST_ROLE(keeps_object) {
 
 // Clients that die in a call, having passed an object and descriptors along.
 TEST(DriverDeath, OfClientsLeavesNothingBehind) {
-    const int kClients = kSanitized || is_kernel_driver() ? 96 : 992;
+    const int kClients = is_slow() || is_kernel_driver() ? 96 : 992;
     constexpr int kAtOnce = 16;
     const Process server = start_server();
     const sp<IBinder> service = find_service();
