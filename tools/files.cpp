@@ -81,7 +81,11 @@ bool write_all(int fd, const void* data, size_t size) {
         const ssize_t count = write(fd, bytes + done, size - done);
         if (count >= 0) {
             done += static_cast<size_t>(count);
-        } else if (errno == EAGAIN) {
+            if (done == size || StopSignals::received() == 0) continue;
+            errno = EINTR;  // came while a part was being written
+            return false;
+        }
+        if (errno == EAGAIN) {
             pollfd slot = {fd, POLLOUT, 0};
             poll(&slot, 1, 1000);
         } else if (errno != EINTR || StopSignals::received() != 0) {

@@ -103,6 +103,11 @@ Wait Queue::wait_for_room(milliseconds timeout) const {
     return ready == 0 ? Wait::kTimedOut : Wait::kReady;
 }
 
+bool Queue::has_room() const {
+    pollfd slot = {object_of(handle_)->iWriteFd, POLLOUT, 0};
+    return poll(&slot, 1, 0) == 1;
+}
+
 Wait Queue::wait_for_message(milliseconds timeout, int output) const {
     // An output that takes nothing at the moment must not have a message taken for it, nor one that is closed.
     pollfd outlet[] = {{output, POLLOUT, 0}, {StopSignals::descriptor(), POLLIN, 0}};

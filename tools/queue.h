@@ -26,6 +26,7 @@ public:
 
     // Waits until there is room for a message of ordinary size, or a signal (StopSignals) comes.
     Wait wait_for_room(std::chrono::milliseconds timeout) const;
+    bool has_room() const;
     // Waits until there is a message, or a signal comes, or the output cannot be written to any more.
     Wait wait_for_message(std::chrono::milliseconds timeout, int output) const;
 
