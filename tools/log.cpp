@@ -41,12 +41,29 @@ void note_end(int) {
     errno = error;
 }
 
+constexpr int kPassedOn[] = {SIGINT, SIGQUIT, SIGTERM, SIGHUP, SIGUSR1, SIGUSR2};
+
+// Holds those signals back until it is known whom to pass them on to.
+class HeldSignals {
+public:
+    HeldSignals() {
+        sigset_t held;
+        sigemptyset(&held);
+        for (const int signal : kPassedOn) sigaddset(&held, signal);
+        sigprocmask(SIG_BLOCK, &held, &usual);
+    }
+    ~HeldSignals() { sigprocmask(SIG_SETMASK, &usual, nullptr); }
+    HeldSignals(const HeldSignals&) = delete;
+    HeldSignals& operator=(const HeldSignals&) = delete;
+    sigset_t usual;
+};
+
 void set_up_signals() {
     if (pipe2(g_ended, O_CLOEXEC | O_NONBLOCK) != 0) throw Failure("no descriptors are left: see 'ulimit -n'");
     struct sigaction action = {};
     action.sa_flags = SA_SIGINFO | SA_RESTART;
     action.sa_sigaction = pass_on;
-    for (const int signal : {SIGINT, SIGQUIT, SIGTERM, SIGHUP, SIGUSR1, SIGUSR2}) sigaction(signal, &action, nullptr);
+    for (const int signal : kPassedOn) sigaction(signal, &action, nullptr);
     action = {};
     action.sa_handler = note_end;
     action.sa_flags = SA_RESTART | SA_NOCLDSTOP;
@@ -68,8 +85,11 @@ int start(const std::vector<std::string>& command, int log, pid_t& pid) {
     sigemptyset(&ignored_here);
     sigaddset(&ignored_here, SIGPIPE);
     posix_spawnattr_setsigdefault(&attributes, &ignored_here);
-    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF);
+    const HeldSignals held;
+    posix_spawnattr_setsigmask(&attributes, &held.usual);
+    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK);
     const int error = posix_spawnp(&pid, arguments[0], &actions, &attributes, arguments.data(), environ);
+    if (error == 0) g_child = pid;
     posix_spawnattr_destroy(&attributes);
     posix_spawn_file_actions_destroy(&actions);
     return error;
@@ -127,7 +147,6 @@ int log(const Options& options) {
         say("cannot run " + options.command[0] + ": " + strerror(error));
         return error == ENOENT ? kNotFound : kNotExecutable;
     }
-    g_child = pid;
     copy_log(ends[0]);
     close(ends[0]);
     int status = 0;

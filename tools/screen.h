@@ -29,8 +29,8 @@ private:
     void leave() const;
     void suspend();
 
-    bool has_keys_;
     termios saved_ = {};
+    bool has_keys_;
 };
 
 }  // namespace tavo::tool

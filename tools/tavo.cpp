@@ -75,6 +75,23 @@ int finish(int status) {
     return status;
 }
 
+// What is wrong with the command line, and where to read how it should be.
+std::string describe(const CLI::ParseError& error, const CLI::App& app, int argc, char** argv) {
+    const CLI::App* chosen = &app;
+    std::string name = "tavo";
+    int next = 1;
+    for (; !chosen->get_subcommands().empty(); ++next) {
+        chosen = chosen->get_subcommands().front();
+        name += " " + chosen->get_name();
+    }
+    const std::string more = " ('" + name + " --help' tells more)";
+    // Of a word that is no subcommand, the parser only says that there is no subcommand.
+    while (next < argc && argv[next][0] == '-') ++next;
+    const bool lacks_subcommand = !chosen->get_subcommands(nullptr).empty();
+    if (lacks_subcommand && next < argc) return name + " has no subcommand " + argv[next] + more;
+    return error.what() + more;
+}
+
 int run_tavo(int argc, char** argv) {
     CLI::App app("Works with message queues, shared memory and semaphores of TAVO OSAL.", "tavo");
     app.require_subcommand(1);
@@ -92,9 +109,7 @@ int run_tavo(int argc, char** argv) {
     } catch (const CLI::Success& asked) {
         return finish(app.exit(asked));
     } catch (const CLI::ParseError& error) {
-        const auto chosen = app.get_subcommands();
-        const std::string help = chosen.empty() ? "tavo" : "tavo " + chosen.front()->get_name();
-        say(std::string(error.what()) + " ('" + help + " --help' tells more)");
+        say(describe(error, app, argc, argv));
         return kMisused;
     }
     choose_log();

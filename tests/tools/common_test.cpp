@@ -47,9 +47,11 @@ TEST_F(Common, WithoutASubcommandIsMisuse) {
 }
 
 TEST_F(Common, AnUnknownSubcommandIsMisuse) {
-    const Result result = tavo({"sned", "7", "x"});
-    EXPECT_EQ(result.status, 2);
-    EXPECT_NE(result.err.find("sned"), std::string::npos) << result;
+    EXPECT_TRUE(failed(tavo({"sned", "7", "x"}), 2, "tavo has no subcommand sned ('tavo --help' tells more)"));
+    EXPECT_TRUE(failed(tavo({"-v", "sned"}), 2, "tavo has no subcommand sned ('tavo --help' tells more)"));
+    EXPECT_TRUE(
+        failed(tavo({"shm", "erase", "9"}), 2, "tavo shm has no subcommand erase ('tavo shm --help' tells more)"));
+    EXPECT_TRUE(failed(tavo({"sem"}), 2, "A subcommand is required ('tavo sem --help' tells more)"));
 }
 
 TEST_F(Common, AnUnknownOptionIsMisuse) {

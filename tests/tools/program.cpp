@@ -142,7 +142,7 @@ void without_the_rights_of_root() {
     prctl(PR_CAPBSET_DROP, CAP_DAC_READ_SEARCH);
 }
 
-Running::Running(const Words& arguments, const Variables& variables) {
+Running::Running(const Words& arguments, const Variables& variables, const char* errors) {
     ::signal(SIGPIPE, SIG_IGN);
     int input[2], output[2];
     EXPECT_TRUE(pipe2(input, O_CLOEXEC) == 0 && pipe2(output, O_CLOEXEC) == 0);
@@ -151,6 +151,9 @@ Running::Running(const Words& arguments, const Variables& variables) {
     posix_spawn_file_actions_adddup2(&actions, input[0], STDIN_FILENO);
     posix_spawn_file_actions_adddup2(&actions, output[1], STDOUT_FILENO);
     posix_spawn_file_actions_adddup2(&actions, output[1], STDERR_FILENO);
+    if (errors != nullptr) {
+        posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, errors, O_WRONLY | O_CREAT | O_TRUNC, 0600);
+    }
     pid_ = spawn(arguments, variables, actions);
     close(input[0]);
     close(output[1]);

@@ -34,7 +34,8 @@ void without_the_rights_of_root();
 // A program that runs beside the test. Killed with the object.
 class Running {
 public:
-    explicit Running(const Words& arguments, const Variables& variables = {});
+    // Its errors come with its output, unless they go to a file.
+    explicit Running(const Words& arguments, const Variables& variables = {}, const char* errors = nullptr);
     virtual ~Running();
     Running(const Running&) = delete;
     Running& operator=(const Running&) = delete;

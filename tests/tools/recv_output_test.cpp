@@ -3,6 +3,7 @@
 #include <signal.h>
 #include <unistd.h>
 
+#include <fstream>
 #include <nlohmann/json.hpp>
 
 #include "tools/program.h"
@@ -46,13 +47,18 @@ TEST_F(RecvOutput, IntoAClosedPipeNoMessageIsTaken) {
 
 TEST_F(RecvOutput, IntoAPipeThatIsFullNoMessageIsTaken) {
     send(std::string(300000, 'x'));  // more than a pipe holds
-    Running receiver({"recv", "7", "--follow"});
+    Running receiver({"recv", "7", "--follow"}, {}, "/sdcard/said");
     receiver.read_until("x");
     send("waits");
     EXPECT_EQ(queue()["pending"], 4 + 5);
     // Interrupted inside the long message, the receiver puts that one back.
     receiver.signal(SIGINT);
     EXPECT_EQ(receiver.wait(), 1);
+    std::string said;
+    std::getline(std::ifstream("/sdcard/said"), said);
+    EXPECT_EQ(said,
+              "tavo: standard output cannot be written to (Interrupted system call): the message was put back, behind "
+              "all others that wait");
     EXPECT_EQ(queue()["pending"], 4 + 5 + 4 + 300000);
     EXPECT_TRUE(succeeded(tavo({"recv", "7", "--timeout", "0"}), "waits"));
     EXPECT_TRUE(succeeded(tavo({"recv", "7", "--timeout", "0"}), std::string(300000, 'x')));
