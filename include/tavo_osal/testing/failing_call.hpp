@@ -35,6 +35,8 @@ bool is_a_caller(const std::string& object);
 
 /** FailingCall's number of the call: every call fails. */
 inline constexpr unsigned kEveryCall = 0;
+/** FailingCall's number of the call: none fails, they are only counted. */
+inline constexpr unsigned kNoCall = 0xFFFFFFFFU;
 
 template <auto Function>
 class FailingCall;
@@ -55,7 +57,7 @@ public:
     /**
      * Begins to count. Ends the program with a message when nobody calls the function, since the test would pass for
      * nothing.
-     * @param nth    1 for the next call and so on, or #kEveryCall
+     * @param nth    1 for the next call and so on, or #kEveryCall, or #kNoCall
      * @param result what the call returns, such as #TAVO_NO_MEMORY or a null pointer
      */
     FailingCall(unsigned nth, Result result)
