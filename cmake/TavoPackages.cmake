@@ -42,8 +42,9 @@ if(TARGET tavo OR TARGET servicemanager)
     tavo_package(tools tavo-tools utils "operating-system abstraction layer, tools"
         "${overview}\nThis package holds the command-line tools." "${library_package} ${same_version}")
 endif()
-set(CPACK_DEBIAN_RUNTIME_PACKAGE_GENERATE_SHLIBS ON)
-set(CPACK_DEBIAN_RUNTIME_PACKAGE_GENERATE_SHLIBS_POLICY ">=")
+set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS ON)
+set(CPACK_DEBIAN_RUNTIME_PACKAGE_CONTROL_EXTRA "${PROJECT_SOURCE_DIR}/packaging/triggers")
+set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS_POLICY ">=")
 
 if(NOT TAVO_RELOCATABLE)
     configure_file(packaging/copyright.in "${PROJECT_BINARY_DIR}/copyright" @ONLY)

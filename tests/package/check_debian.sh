@@ -78,7 +78,7 @@ expect "the soname" "$(dynamic "$lib/libtavoosal.so.0" SONAME)" libtavoosal.so.0
 expect "libtavoosal's RUNPATH" "$(dynamic "$lib/libtavoosal.so.0" RUNPATH)" "/$lib/tavoosal:/$lib/android"
 expect "libbinder's RUNPATH" "$(dynamic "$lib/tavoosal/libbinder.so" RUNPATH)" "/$lib/android"
 while read -r file; do
-    if [[ $(head -c 4 "$file") == $'\x7fELF' ]]; then
+    if [[ $file != *.a ]] && readelf -h "$file" >/dev/null 2>&1; then
         if readelf -d "$file" | grep -E '(RPATH|RUNPATH)' | grep -E "ORIGIN|$work|$source"; then fail "$file: RUNPATH as above"; fi
         if readelf -S "$file" | grep -q '\.debug_info'; then fail "$file is not stripped"; fi
     fi
