@@ -5,8 +5,8 @@
 //     OBJECT FUNCTION before|after|NUMBER N kill|stop own|any
 //
 // It is reached in front of, or behind, the N-th call of the function from the object, of the calling thread's (own)
-// or of any thread's (any). Of write, a NUMBER is how many bytes of the call's go out before the point is reached. What is
-// called for a reply does not end in front of recvmsg before the reply is there to be received.
+// or of any thread's (any). Of write, a NUMBER is how many bytes of the call's go out before the point is reached. What
+// is called for a reply does not end in front of recvmsg before the reply is there to be received.
 #pragma once
 
 #include <sys/types.h>

@@ -200,7 +200,9 @@ void Peer::kill() {
 bool is_in(pid_t pid, long call) {
     std::ifstream file("/proc/" + std::to_string(pid) + "/syscall");
     long number = -1;
-    return file >> number && number == call;
+    std::string argument;
+    // Standard input and output are where it waits for commands.
+    return file >> number >> argument && number == call && std::stoull(argument, nullptr, 16) > 2;
 }
 
 testing::AssertionResult waits_in(pid_t pid, long call) {

@@ -10,23 +10,23 @@
 
 namespace tavo::test {
 
-constexpr char kUnavailable[] = "1";          // attach: no service
-constexpr char kNoQueue[] = "37638";          // TAVO_MQ_NOT_AVAILABLE
-constexpr char kFailure[] = "36865";          // TAVO_FAILURE
-constexpr char kDone[] = "0";                 // TAVO_SUCCESS
-constexpr char kEnded[] = "ended";            // the process is gone
+constexpr char kUnavailable[] = "1";  // attach: no service
+constexpr char kNoQueue[] = "37638";  // TAVO_MQ_NOT_AVAILABLE
+constexpr char kFailure[] = "36865";  // TAVO_FAILURE
+constexpr char kDone[] = "0";         // TAVO_SUCCESS
+constexpr char kEnded[] = "ended";    // the process is gone
 
 // Commands; each is answered with one line.
 //     arm POINT                 see crash_point.h                                         0
 //     serve                     tavo_osal_init()                                          its status
 //     attach KEY, destroy KEY   one handle a key                                          the status
 //     put KEY SIZE              a message of this size, whose bytes follow from it        the status
-//     get KEY                                                                             SIZE whole|short, or the status
-//     acquire KEY SIZE, release KEY, delete KEY SIZE                                      the status
-//     set KEY BYTE, see KEY     the block's first byte                                    0, the byte
-//     semaphore KEY, lock, unlock                                                         the status
-//     hammer KEY                attaches, acquires and gives back until a status is not 0 all those statuses
-//     limit COUNT               of descriptors from now on                                0
+//     get KEY                                                                             SIZE whole|short, or the
+//     status acquire KEY SIZE, release KEY, delete KEY SIZE                                      the status set KEY
+//     BYTE, see KEY     the block's first byte                                    0, the byte semaphore KEY, lock,
+//     unlock                                                         the status hammer KEY                attaches,
+//     acquires and gives back until a status is not 0 all those statuses limit COUNT               of descriptors from
+//     now on                                0
 class Peer {
 public:
     Peer() : process_(Process::start("peer")) {}
@@ -59,7 +59,9 @@ struct Holdings {
     static constexpr size_t kMostThreads = 17;  // the first, the housekeeper, and 15 of the pool
     size_t descriptors, threads, blocks;
     explicit Holdings(pid_t pid = 0)
-        : descriptors(count_descriptors(pid)), threads(count_threads(pid)), blocks(count_mappings(pid, "SharedMemory_")) {}
+        : descriptors(count_descriptors(pid)),
+          threads(count_threads(pid)),
+          blocks(count_mappings(pid, "SharedMemory_")) {}
     // No more than before. Threads that the pool has grown by stay, up to its maximum.
     bool within(const Holdings& before) const {
         return descriptors <= before.descriptors && blocks <= before.blocks &&

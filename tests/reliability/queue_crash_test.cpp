@@ -75,7 +75,7 @@ TEST_P(SenderCrash, InsideAFrameThatIsWaitedForGivesWhatCame) {
     Peer sender("attach 7");
     receiver.tell("get 7");
     ASSERT_TRUE(waits_in(receiver.pid(), SYS_read));
-    sender.crash("libtavoosal.so write " + std::to_string(GetParam().bytes) + " 1", "put 7 1000");
+    sender.crash("libtavoosal.so write " + std::to_string(GetParam().bytes) + " 1", "put 7 5000");
     EXPECT_EQ(receiver.answer(), GetParam().result);
     Peer next("attach 7");
     EXPECT_EQ(next.ask("put 7 1000"), kDone);
@@ -152,8 +152,8 @@ TEST_F(QueueCrash, SenderOfAFullQueueWaitsForTheNextReceiver) {
 }
 
 constexpr const char* kCalls[] = {
-    "libbinder.so sendmsg before",  "libbinder.so sendmsg after", "libbinder.so recvmsg before",
-    "libbinder.so recvmsg after",   "libtavoosal.so fcntl before", "libtavoosal.so fcntl after",
+    "libbinder.so sendmsg before", "libbinder.so sendmsg after",  "libbinder.so recvmsg before",
+    "libbinder.so recvmsg after",  "libtavoosal.so fcntl before", "libtavoosal.so fcntl after",
     "libtavoosal.so pipe2 before",
 };
 
@@ -195,8 +195,7 @@ TEST_P(DestroyCrash, AnywhereInADestroyGivesTheUseBackAtMostOnce) {
     expect_service();
 }
 
-INSTANTIATE_TEST_SUITE_P(At, DestroyCrash,
-                         testing::Values(kCalls[0], kCalls[1], kCalls[2], kCalls[3]),
+INSTANTIATE_TEST_SUITE_P(At, DestroyCrash, testing::Values(kCalls[0], kCalls[1], kCalls[2], kCalls[3]),
                          [](const auto& test) { return tavo::test::words(test.param); });
 
 }  // namespace

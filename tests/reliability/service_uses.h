@@ -25,18 +25,20 @@ inline int take_queue_uses(int key) {
     return count;
 }
 
-// The same of a block; the service does not tell when there is none left, but its memory file goes with the last one.
-inline int take_block_uses(uint32_t key, pid_t server) {
+// The same of a block. The service does not tell when there is none left: the next block has no mark then.
+inline int take_block_uses(uint32_t key) {
     const android::sp<android::ITavoBinder> service = tavo_osal_get_service(nullptr);
     if (service == nullptr) return -1;
-    const std::string name = "SharedMemory_" + std::to_string(key) + "\n";
-    int count = 0;
-    for (; count < 100 && count_memory_files(server, name) > 0; ++count) {
-        service->delete_shared_mem(static_cast<int>(key));
-        // A dead client's reference may go a little later.
-        if (count > 0) comes_true([&] { return count_memory_files(server, name) == 0; });
+    const auto take = [&] { service->delete_shared_mem(static_cast<int>(key)); };
+    const Block marked(key, 100);
+    marked.bytes()[99] = 'm';
+    for (int count = 0;; ++count) {
+        take();
+        const Block found(key, 100);
+        const bool is_last = found.bytes()[99] != 'm';
+        take();  // this look's own
+        if (is_last) return count;
     }
-    return count;
 }
 
 inline int bytes_in(int descriptor) {
@@ -58,7 +60,7 @@ inline std::string words(const std::string& point) {
 
 // Kills a client at every one of its calls to the platform while it obeys a command; how many there were.
 inline int kill_everywhere(const std::string& calls, const std::string& before, const std::string& command,
-                    const std::function<void()>& check) {
+                           const std::function<void()>& check) {
     for (int n = 1;; ++n) {
         Peer client;
         if (!before.empty()) {
