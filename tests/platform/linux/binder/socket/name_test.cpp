@@ -1,6 +1,10 @@
 // Names as files in the runtime directory.
 #include <fcntl.h>
+#include <signal.h>
+#include <sys/file.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 #include <unistd.h>
 #include <utils/String8.h>
 
@@ -30,6 +34,32 @@ TEST(SocketName, OfAnythingElseInTheDirectoryIsNotListed) {
     ASSERT_EQ(publish("file", new TestService), OK) << "a file gives way";
     EXPECT_NE(publish("directory", new TestService), OK);
     EXPECT_EQ(listed(), std::vector<std::string>{"file"});
+}
+
+TEST(SocketName, IsPublishedWithoutTheLeftoversOfWhoWasKilledWhilePublishing) {
+    const auto bind_one = [](const std::string& name) {
+        const int fd = socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        ("/run/binder/" + name).copy(address.sun_path, sizeof address.sun_path - 1);
+        EXPECT_EQ(bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+        close(fd);
+    };
+    const auto exists = [](const std::string& name) { return access(("/run/binder/" + name).c_str(), F_OK) == 0; };
+    bind_one(".0123456789abcdef");
+    bind_one(".0123456789abcdeF");  // somebody else's
+    bind_one("0123456789abcdef0");
+    const int other = open("/run/binder", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    ASSERT_EQ(flock(other, LOCK_SH), 0);  // somebody is publishing: it may be his
+    const sp<IBinder> own = new TestService;
+    ASSERT_EQ(publish("name", own), OK);
+    EXPECT_TRUE(exists(".0123456789abcdef"));
+    close(other);
+    ASSERT_EQ(publish("name", own), OK);
+    EXPECT_FALSE(exists(".0123456789abcdef"));
+    EXPECT_TRUE(exists(".0123456789abcdeF"));
+    EXPECT_TRUE(exists("0123456789abcdef0"));
+    EXPECT_EQ(find_service("name"), own);
 }
 
 TEST(SocketName, MustBeAFileName) {

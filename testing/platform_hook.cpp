@@ -1,5 +1,6 @@
-#include "support/platform_fault.h"
+#include "tavo_osal/testing/platform_hook.hpp"
 
+#include <dlfcn.h>
 #include <elf.h>
 #include <link.h>
 #include <sys/mman.h>
@@ -30,7 +31,7 @@ struct Tables {
 };
 
 struct Search {
-    const char* object;
+    const ObjectFilter& wanted;
     const char* function;
     std::vector<void**> found;
 };
@@ -80,8 +81,7 @@ void scan(const Tables& tables, uintptr_t start, size_t size, Search& search) {
 int visit(dl_phdr_info* info, size_t, void* data) {
     Search& search = *static_cast<Search*>(data);
     const char* slash = strrchr(info->dlpi_name, '/');
-    const char* name = slash != nullptr ? slash + 1 : info->dlpi_name;
-    if (strncmp(name, search.object, strlen(search.object)) != 0) return 0;
+    if (!search.wanted(slash != nullptr ? slash + 1 : info->dlpi_name)) return 0;
 
     const Tables tables = read_tables(*info);
     if (tables.plt_has_addends) {
@@ -91,7 +91,7 @@ int visit(dl_phdr_info* info, size_t, void* data) {
     }
     scan<ElfW(Rela)>(tables, tables.rela, tables.rela_size, search);
     scan<ElfW(Rel)>(tables, tables.rel, tables.rel_size, search);
-    return 1;
+    return 0;
 }
 
 // The table may have been made read-only after loading.
@@ -107,13 +107,16 @@ void write_slot(void** slot, void* value) {
 
 }  // namespace
 
-PlatformHook::PlatformHook(const char* object, const char* function, void* replacement) {
-    Search search{object, function, {}};
+PlatformHook::PlatformHook(const char* object, const char* function, void* replacement)
+    : PlatformHook(object_named(object), function, replacement) {
+    if (active()) return;
+    fprintf(stderr, "%s does not import %s: there is nothing to hook\n", object, function);
+    abort();
+}
+
+PlatformHook::PlatformHook(const ObjectFilter& objects, const char* function, void* replacement) {
+    Search search{objects, function, {}};
     dl_iterate_phdr(visit, &search);
-    if (search.found.empty()) {
-        fprintf(stderr, "%s does not import %s: there is nothing to hook\n", object, function);
-        abort();
-    }
     for (void** slot : search.found) {
         slots_.push_back({slot, *slot});
         write_slot(slot, replacement);
@@ -122,6 +125,19 @@ PlatformHook::PlatformHook(const char* object, const char* function, void* repla
 
 PlatformHook::~PlatformHook() {
     for (const Slot& slot : slots_) write_slot(slot.address, slot.original);
+}
+
+ObjectFilter object_named(std::string beginning) {
+    return [beginning = std::move(beginning)](const std::string& object) { return object.rfind(beginning, 0) == 0; };
+}
+
+void* function_named(const char* name) {
+    void* const function = dlsym(RTLD_DEFAULT, name);
+    if (function == nullptr) {
+        fprintf(stderr, "no function %s: the library must be linked as a shared one\n", name);
+        abort();
+    }
+    return function;
 }
 
 }  // namespace tavo::test
