@@ -48,7 +48,7 @@ apt() { APT_CONFIG=$work/apt.conf apt-get -q -y --no-install-recommends "$@"; }
 echo "sysroot.sh: fetching for $architecture: $*"
 # Some of the indexes may be enough. Only when all were had, a package that cannot be found is a wrong name.
 indexes=0
-apt -o APT::Update::Error-Mode=any update >"$work/log" 2>&1 || indexes=77
+apt update >"$work/log" 2>&1 || indexes=77
 apt install --print-uris "$@" >>"$work/log" 2>&1 || {
     cat "$work/log" >&2
     [[ $indexes -ne 0 ]] || die 1 "there is no way to install: $*"
