@@ -32,6 +32,7 @@ cat >>"$work/apt.conf" <<END
 APT::Architecture "$architecture";
 APT::Architectures { "$architecture"; };
 APT::Sandbox::User "root";
+APT::Update::Error-Mode "any";
 Acquire::Retries "3";
 Dir::State "$work";
 Dir::State::lists "$work/lists";

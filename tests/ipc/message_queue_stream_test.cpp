@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "message_queue_test.h"
+#include "support/pace.h"
 #include "support/process.h"
 
 namespace {
@@ -20,12 +21,8 @@ namespace {
 using android::TAVO_MessageQueue;
 using namespace tavo::test;
 
-// Sanitizers slow the copies and comparisons down, not the pipe: a twentieth shows the same.
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr uint64_t kShare = 20;
-#else
-constexpr uint64_t kShare = 1;
-#endif
+// Sanitizers and emulators slow the copies and comparisons down, not the pipe: a twentieth shows the same.
+uint64_t share() { return is_slow() ? 20 : 1; }
 
 std::vector<int> allowed_cpus() {
     cpu_set_t set;
@@ -131,7 +128,7 @@ TEST_P(MessageQueueStream, DeliversEveryMessageWhole) {
     const Affinity kept;
     const std::vector<int> cpus = allowed_cpus();
     if (stream.two_cpus && cpus.size() < 2) GTEST_SKIP() << "only one CPU may be used";
-    const uint64_t count = stream.count / kShare;
+    const uint64_t count = stream.count / share();
     const int writers_cpu = stream.two_cpus ? cpus.back() : cpus.front();
 
     TAVO_MessageQueue queue;

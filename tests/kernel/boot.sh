@@ -18,9 +18,10 @@ die() {
     exit 1
 }
 
+# A second emulated ARM processor costs more than it does: each waits for the other whenever a mapping goes.
 case $architecture in
-    amd64) machine=(qemu-system-x86_64 -machine pc) console=ttyS0 ;;
-    armhf) machine=(qemu-system-arm -machine "virt,highmem=off" -cpu cortex-a15) console=ttyAMA0 ;;
+    amd64) machine=(qemu-system-x86_64 -machine pc -smp 2) console=ttyS0 ;;
+    armhf) machine=(qemu-system-arm -machine "virt,highmem=off" -cpu cortex-a15 -smp 1) console=ttyAMA0 ;;
     *) die "no machine is known for $architecture" ;;
 esac
 modules=(virtio_pci virtio_console 9pnet_virtio 9p overlay binder_linux)
@@ -56,7 +57,7 @@ share() { # NAME FOLDER
     arguments+=(-fsdev "local,id=$1,path=$2,security_model=none,readonly=on,multidevs=remap"
         -device "virtio-9p-pci,fsdev=$1,mount_tag=$1")
 }
-arguments=("${machine[@]}" -accel "tcg,thread=multi" -smp "$slots" -m 1024 -nodefaults -no-user-config -no-reboot -display none
+arguments=("${machine[@]}" -accel "tcg,thread=multi" -m 1024 -nodefaults -no-user-config -no-reboot -display none
     -kernel "$kernel" -initrd "$guest/initramfs.cpio"
     -append "console=$console panic=-1 oops=panic mitigations=off quiet"
     -serial "file:$guest/console" -device virtio-serial-pci)

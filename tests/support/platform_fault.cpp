@@ -46,15 +46,17 @@ Tables read_tables(const dl_phdr_info& info) {
     }
     for (; entry != nullptr && entry->d_tag != DT_NULL; ++entry) {
         const uintptr_t value = static_cast<uintptr_t>(entry->d_un.d_ptr);
+        // glibc has made addresses of what are distances from the base in the file; other C libraries have not.
+        const uintptr_t address = value < tables.base ? tables.base + value : value;
         switch (entry->d_tag) {
-            case DT_SYMTAB: tables.symbols = reinterpret_cast<const ElfW(Sym)*>(value); break;
-            case DT_STRTAB: tables.strings = reinterpret_cast<const char*>(value); break;
-            case DT_JMPREL: tables.plt = value; break;
+            case DT_SYMTAB: tables.symbols = reinterpret_cast<const ElfW(Sym)*>(address); break;
+            case DT_STRTAB: tables.strings = reinterpret_cast<const char*>(address); break;
+            case DT_JMPREL: tables.plt = address; break;
             case DT_PLTRELSZ: tables.plt_size = value; break;
             case DT_PLTREL: tables.plt_has_addends = value == DT_RELA; break;
-            case DT_RELA: tables.rela = value; break;
+            case DT_RELA: tables.rela = address; break;
             case DT_RELASZ: tables.rela_size = value; break;
-            case DT_REL: tables.rel = value; break;
+            case DT_REL: tables.rel = address; break;
             case DT_RELSZ: tables.rel_size = value; break;
             default: break;
         }

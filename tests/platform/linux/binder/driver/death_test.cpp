@@ -155,7 +155,7 @@ TEST_ROLE(keeps_object) {
 
 // Clients that die in a call, having passed an object and descriptors along.
 TEST(DriverDeath, OfClientsLeavesNothingBehind) {
-    const int kClients = kSanitized || is_kernel_driver() ? 96 : 992;
+    const int count = is_slow() || is_kernel_driver() ? 96 : 992;
     constexpr int kAtOnce = 16;
     const Process server = start_server();
     const sp<IBinder> service = find_service();
@@ -171,7 +171,7 @@ TEST(DriverDeath, OfClientsLeavesNothingBehind) {
     std::this_thread::sleep_for(std::chrono::milliseconds(200));
     const size_t descriptors = count_descriptors(server.pid());
     const size_t threads = count_threads(server.pid());
-    for (int i = kAtOnce; i < kClients; i += kAtOnce) kill_some();
+    for (int i = kAtOnce; i < count; i += kAtOnce) kill_some();
     EXPECT_TRUE(settled(descriptors)) << count_descriptors(server.pid()) << " descriptors, " << descriptors
                                       << " before";
     EXPECT_LE(count_threads(server.pid()), threads + 15);

@@ -89,7 +89,7 @@ TEST(DriverProcess, ExitsUnderLoad) {
         const auto start = steady_clock::now();
         EXPECT_EQ(service->transact(TestService::kExit, Parcel(), nullptr), DEAD_OBJECT);
         EXPECT_EQ(server.wait(), 0);
-        EXPECT_LT(steady_clock::now() - start, std::chrono::milliseconds(kSanitized ? 5000 : 2000));
+        EXPECT_LT(steady_clock::now() - start, std::chrono::milliseconds(is_slow() ? 5000 : 2000));
         for (std::thread& caller : callers) caller.join();
     }
 }
@@ -104,7 +104,7 @@ TEST(DriverProcess, ExitsThoughACallDoesNotEnd) {
     EXPECT_EQ(service->transact(TestService::kExit, Parcel(), nullptr), DEAD_OBJECT);
     EXPECT_EQ(server.wait(), 0);
     EXPECT_GE(steady_clock::now() - start, std::chrono::milliseconds(900)) << "it has been given a moment";
-    EXPECT_LT(steady_clock::now() - start, std::chrono::milliseconds(kSanitized ? 5000 : 2500));
+    EXPECT_LT(steady_clock::now() - start, std::chrono::milliseconds(is_slow() ? 5000 : 2500));
     caller.join();
 }
 
@@ -196,7 +196,7 @@ TEST(DriverProcess, IsNotDisturbedByAForkedCopyThatExits) {
         const auto start = steady_clock::now();
         ASSERT_EQ(waitpid(child, &status, 0), child);
         EXPECT_EQ(status, 0);
-        EXPECT_LT(steady_clock::now() - start, std::chrono::milliseconds(kSanitized ? 4000 : 900));
+        EXPECT_LT(steady_clock::now() - start, std::chrono::milliseconds(is_slow() ? 4000 : 900));
         EXPECT_EQ(service->pingBinder(), OK);
         EXPECT_EQ(ask(service, TestService::kPingKept), OK);
     }

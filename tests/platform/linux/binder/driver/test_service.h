@@ -15,15 +15,10 @@
 #include <string>
 #include <vector>
 
+#include "support/pace.h"
 #include "support/process.h"
 
 namespace tavo::test {
-
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr bool kSanitized = true;
-#else
-constexpr bool kSanitized = false;
-#endif
 
 // Whether the tests run on the kernel's driver, with a service manager, and not on sockets.
 bool is_kernel_driver();
