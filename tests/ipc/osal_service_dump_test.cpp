@@ -153,6 +153,8 @@ TEST_F(OsalServiceDump, OfAServiceThatWasNotInitialisedSaysSo) {
 TEST_F(OsalServiceDump, WithoutAFreeDescriptorLeavesThePipesOut) {
     start();
     service_->create_message_queue(7);
+    // A sanitizer that sees a class for the first time needs a descriptor to look at it.
+    ASSERT_EQ(dump_of(service_, {"--json"}).status, 0);
     int ends[2];
     ASSERT_EQ(pipe2(ends, O_CLOEXEC), 0);
     {
