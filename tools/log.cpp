@@ -7,6 +7,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
@@ -27,7 +28,7 @@ struct Options {
     std::vector<std::string> command;
 };
 
-volatile sig_atomic_t g_child = 0;
+std::atomic<pid_t> g_child{0};
 int g_ended[2] = {-1, -1};
 
 // A terminal sends its signals to the command as well; what somebody sent to this process alone is passed on.
@@ -73,6 +74,7 @@ void set_up_signals() {
 // Starts the command with its standard error going into the descriptor; 0, or the errno of the failure.
 int start(const std::vector<std::string>& command, int log, pid_t& pid) {
     std::vector<char*> arguments;
+    arguments.reserve(command.size() + 1);
     for (const std::string& word : command) arguments.push_back(const_cast<char*>(word.c_str()));
     arguments.push_back(nullptr);
     posix_spawn_file_actions_t actions;

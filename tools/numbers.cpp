@@ -58,7 +58,8 @@ uint64_t parse_size(const std::string& text) {
 
 std::chrono::milliseconds milliseconds_of(double seconds) {
     constexpr double kDay = 86400;
-    return std::chrono::milliseconds(seconds < 0 ? -1 : static_cast<long>(std::min(seconds, kDay) * 1000));
+    const bool is_limit = seconds >= 0;
+    return std::chrono::milliseconds(is_limit ? static_cast<long>(std::min(seconds, kDay) * 1000) : -1);
 }
 
 std::string short_number(double value) {

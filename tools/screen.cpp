@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <cerrno>
 
 #include "tools/files.h"
@@ -24,11 +25,12 @@ constexpr char kHome[] = "\033[H";
 constexpr char kEndOfLine[] = "\033[K\r\n";
 constexpr char kEndOfScreen[] = "\033[K\033[J";
 
-volatile sig_atomic_t g_resized = 0;
-volatile sig_atomic_t g_suspended = 0;
+// A signal may be handled on any thread.
+std::atomic<bool> g_resized{false};
+std::atomic<bool> g_suspended{false};
 
-void note_resize(int) { g_resized = 1; }
-void note_suspension(int) { g_suspended = 1; }
+void note_resize(int) { g_resized = true; }
+void note_suspension(int) { g_suspended = true; }
 
 void handle(int signal, void (*handler)(int)) {
     struct sigaction action = {};
@@ -90,7 +92,7 @@ void Screen::leave() const {
 }
 
 void Screen::suspend() {
-    g_suspended = 0;
+    g_suspended = false;
     leave();
     raise(SIGSTOP);
     enter();
@@ -111,12 +113,12 @@ void Screen::draw(const std::string& text) {
 
 Screen::Event Screen::wait_until(steady_clock::time_point time) {
     for (;;) {
-        if (g_suspended != 0) {
+        if (g_suspended) {
             suspend();
             return Event::kResized;
         }
-        if (g_resized != 0) {
-            g_resized = 0;
+        if (g_resized) {
+            g_resized = false;
             return Event::kResized;
         }
         const auto left = std::chrono::duration_cast<milliseconds>(time - steady_clock::now());

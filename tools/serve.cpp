@@ -90,7 +90,8 @@ int serve(const Options& options) {
     while (sigwait(&ends, &signal) != 0) {
     }
     notify_supervisor("STOPPING=1");
-    return kDone;
+    // The threads that serve cannot be stopped, and must not meet objects that are being destroyed.
+    _exit(kDone);
 }
 
 }  // namespace

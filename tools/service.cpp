@@ -87,14 +87,19 @@ void within(milliseconds patience, const char* what, std::function<void()> call)
         bool done = false;
     };
     const auto state = std::make_shared<State>();
-    std::thread([state, call = std::move(call)] {
+    std::thread caller([state, call = std::move(call)] {
         call();
         const std::lock_guard<std::mutex> lock(state->mutex);
         state->done = true;
         state->changed.notify_all();
-    }).detach();
+    });
     std::unique_lock<std::mutex> lock(state->mutex);
-    if (state->changed.wait_for(lock, patience, [&] { return state->done; })) return;
+    if (state->changed.wait_for(lock, patience, [&] { return state->done; })) {
+        lock.unlock();
+        caller.join();
+        return;
+    }
+    caller.detach();
     g_given_up = true;
     throw Failure(std::string(what) + " does not answer: it may be stopped, or hang; 'tavo doctor' looks closer");
 }

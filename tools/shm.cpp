@@ -70,8 +70,8 @@ BlockFigures existing(const std::string& text) {
 }
 
 struct Range {
-    uint64_t offset;
-    uint64_t size;
+    size_t offset;
+    size_t size;
 };
 
 // The part of a block that was asked for; everything behind the offset when no size was given.
@@ -81,13 +81,13 @@ Range range_in(const BlockFigures& block, const Options& options) {
     if (offset > size)
         throw Failure("offset " + options.offset + " lies behind the end of the block, which has " +
                       std::to_string(size) + " bytes");
-    if (options.size.empty()) return {offset, size - offset};
+    if (options.size.empty()) return {static_cast<size_t>(offset), static_cast<size_t>(size - offset)};
     const uint64_t wanted = parse_size(options.size);
     if (wanted > size - offset) {
         throw Failure("the block has only " + std::to_string(size - offset) + " bytes from there on, not " +
                       options.size);
     }
-    return {offset, wanted};
+    return {static_cast<size_t>(offset), static_cast<size_t>(wanted)};
 }
 
 int create(const Options& options) {
@@ -105,7 +105,7 @@ int create(const Options& options) {
     return kDone;
 }
 
-std::string input_for(const Options& options, uint64_t limit) {
+std::string input_for(const Options& options, size_t limit) {
     const bool is_input = options.has_text && options.text == "-" && options.file.empty();
     if (!is_input && options.has_text == !options.file.empty()) {
         throw Misuse("write what? A TEXT, a file (--file FILE) or standard input (-)");

@@ -4,6 +4,7 @@
 #include <signal.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 
 #include "tools/command.h"
@@ -13,7 +14,8 @@ namespace {
 
 constexpr int kSignals[] = {SIGINT, SIGTERM, SIGHUP};
 int g_ends[2] = {-1, -1};
-volatile sig_atomic_t g_received = 0;
+// A signal may be handled on any thread.
+std::atomic<int> g_received{0};
 
 void note(int signal) {
     const int error = errno;

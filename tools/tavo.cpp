@@ -121,5 +121,10 @@ int run_tavo(int argc, char** argv) {
 
 int main(int argc, char** argv) {
     signal(SIGPIPE, SIG_IGN);  // failed writes are told by their calls
-    return tavo::tool::run_tavo(argc, argv);
+    try {
+        return tavo::tool::run_tavo(argc, argv);
+    } catch (const std::exception& failure) {
+        fprintf(stderr, "tavo: %s\n", failure.what());
+        return tavo::tool::kFailed;
+    }
 }

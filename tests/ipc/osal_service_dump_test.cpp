@@ -153,6 +153,8 @@ TEST_F(OsalServiceDump, OfAServiceThatWasNotInitialisedSaysSo) {
 TEST_F(OsalServiceDump, WithoutAFreeDescriptorLeavesThePipesOut) {
     start();
     service_->create_message_queue(7);
+    // A sanitizer that sees a class for the first time needs a descriptor to look at it.
+    ASSERT_EQ(dump_of(service_, {"--json"}).status, 0);
     int ends[2];
     ASSERT_EQ(pipe2(ends, O_CLOEXEC), 0);
     {
@@ -160,7 +162,7 @@ TEST_F(OsalServiceDump, WithoutAFreeDescriptorLeavesThePipesOut) {
         const int last = open("/dev/null", O_RDONLY | O_CLOEXEC);
         ASSERT_GE(last, 0);
         EXPECT_EQ(service_->dump(ends[1], dump_arguments({"--json"})), 0);
-        EXPECT_EQ(dump_to(ends[1]), 0);
+        EXPECT_EQ(service_->dump(ends[1], dump_arguments({})), 0);
         close(last);
     }
     close(ends[1]);

@@ -43,7 +43,9 @@ for name in "${subcommands[@]}"; do
     told=$(grep -oE '^\.It .*Fl -[a-z]+' "$manual/tavo-$name.1" | grep -oE -- '-[a-z]+$' | sed 's/^/-/' | sort -u || true)
     [[ $has == "$told" ]] || complain "tavo-$name.1 describes '${told//$'\n'/ }', but there are '${has//$'\n'/ }'"
 done
-for page in "$manual"/tavo-*.1; do
+# Other commands have pages here, too.
+mapfile -t pages < <(grep -lE '^\.Nm tavo [a-z]' "$manual"/tavo-*.1)
+for page in "${pages[@]}"; do
     name=${page##*/tavo-}
     [[ " ${subcommands[*]} " == *" ${name%.1} "* ]] || complain "${page##*/} is of no subcommand"
 done
