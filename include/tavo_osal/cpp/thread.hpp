@@ -37,7 +37,7 @@ public:
         start(error, std::forward<Function>(function), std::forward<Arguments>(arguments)...);
     }
 #ifdef TAVO_HAS_EXCEPTIONS
-    /** Starts a thread. @throws std::system_error @param function as above @param arguments as above */
+    /** Starts a thread. @param function as above @param arguments as above @throws std::system_error */
     template <typename Function, typename... Arguments,
               std::enable_if_t<std::is_invocable_v<std::decay_t<Function>, std::decay_t<Arguments>...>, int> = 0>
     explicit Thread(Function&& function, Arguments&&... arguments) {
@@ -46,7 +46,9 @@ public:
         });
     }
 #endif
+    /** Takes over what the other one owns, which is empty then. */
     Thread(Thread&& other) noexcept : thread_(other.thread_), joinable_(std::exchange(other.joinable_, false)) {}
+    /** Gives up its own, and takes over what the other one owns. */
     Thread& operator=(Thread&& other) noexcept {
         const Thread old(std::move(*this));
         thread_ = other.thread_;
@@ -76,6 +78,7 @@ public:
 #ifdef TAVO_HAS_EXCEPTIONS
     /** @name The same, throwing std::system_error
      *  @{ */
+    /** As the one above with the same name and arguments; a failure is thrown as std::system_error. */
     void join() {
         detail::or_throw("tavo::Thread::join", [this](std::error_code& error) { join(error); });
     }
