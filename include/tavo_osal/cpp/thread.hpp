@@ -106,8 +106,11 @@ private:
     template <typename Call>
     static void* run(void* argument) {
         const std::unique_ptr<Call> call(static_cast<Call*>(argument));
-        std::apply([](auto&& function, auto&&... values) { std::invoke(std::move(function), std::move(values)...); },
-                   std::move(*call));
+        std::apply(
+            [](auto&& function, auto&&... values) {
+                std::invoke(std::forward<decltype(function)>(function), std::forward<decltype(values)>(values)...);
+            },
+            std::move(*call));
         return nullptr;
     }
 
