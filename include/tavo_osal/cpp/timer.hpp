@@ -152,7 +152,8 @@ private:
  * fires one tick after its duration has passed, as the worker counts it.
  *
  * Freeing a timer does not wait for its callback, which may be running on the worker: what a callback refers to has to
- * stay until the Timers has ended. The callback itself is kept while it runs.
+ * stay until the Timers has ended. The callback itself is kept while it runs. Callbacks
+ * are not to be cancelled (tavo_osal_thread_cancel()).
  */
 class Timer {
 public:
