@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <condition_variable>
+#include <cstdlib>
 #include <mutex>
 #include <vector>
 
@@ -17,10 +18,11 @@ namespace {
 constexpr char kLibrary[] = "libtavoosal.so";
 
 struct Worker {
-    pthread_t thread = pthread_self();
-    sem_t go = {};
-    bool asleep = false;
-    bool ending = false;  // is being joined, and must not sleep any more
+    pthread_t thread;
+    sem_t go;
+    bool listed;
+    bool asleep;
+    bool ending;  // is being joined, and must not sleep any more
 };
 
 std::mutex g_mutex;
@@ -29,30 +31,40 @@ bool g_driving = false;
 std::vector<Worker*> g_workers;  // those that have slept
 uint32_t g_last_sleep = 0;
 
-// A thread's entry in the list, for as long as the thread runs, however it ends.
-class Entry {
-public:
-    Entry() {
-        sem_init(&worker_.go, 0, 0);
+// Takes a thread off the list when it ends, however it ends: a cancelled one is in a signal handler, so nothing is
+// freed here, and no object with a destructor would do.
+void forget(void* ended) {
+    auto* worker = static_cast<Worker*>(ended);
+    {
         const std::lock_guard<std::mutex> lock(g_mutex);
-        g_workers.push_back(&worker_);
+        g_workers.erase(std::find(g_workers.begin(), g_workers.end(), worker));
     }
-    ~Entry() {
-        {
-            const std::lock_guard<std::mutex> lock(g_mutex);
-            g_workers.erase(std::find(g_workers.begin(), g_workers.end(), &worker_));
-        }
-        g_changed.notify_all();
-        sem_destroy(&worker_.go);
+    g_changed.notify_all();
+    sem_destroy(&worker->go);
+}
+
+pthread_key_t forgetting_key() {
+    static const pthread_key_t key = [] {
+        pthread_key_t made = 0;
+        if (pthread_key_create(&made, &forget) != 0) abort();
+        return made;
+    }();
+    return key;
+}
+
+// The calling thread's entry in the list.
+Worker& listed_worker() {
+    static thread_local Worker worker;
+    if (!worker.listed) {
+        sem_init(&worker.go, 0, 0);
+        worker.thread = pthread_self();
+        worker.listed = true;
+        const std::lock_guard<std::mutex> lock(g_mutex);
+        g_workers.push_back(&worker);
+        pthread_setspecific(forgetting_key(), &worker);
     }
-    Entry(const Entry&) = delete;
-    Entry& operator=(const Entry&) = delete;
-
-    Worker& worker() { return worker_; }
-
-private:
-    Worker worker_;
-};
+    return worker;
+}
 
 enum class Sleep { by_itself, by_hand, not_at_all };
 
@@ -68,8 +80,7 @@ Sleep lie_down(Worker& worker, uint32_t micros) {
 }
 
 TAVO_Status sleep_by_hand(uint32_t micros) {
-    thread_local Entry entry;
-    Worker& worker = entry.worker();
+    Worker& worker = listed_worker();
     const Sleep sleep = lie_down(worker, micros);
     if (sleep == Sleep::by_itself) {
         return function_named_as<TAVO_Status(uint32_t)>("tavo_osal_thread_usleep")(micros);

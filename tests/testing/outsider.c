@@ -12,16 +12,16 @@ static int serve(const char* program) {
     TAVO_INT64 queue;
     int status = -1;
     if (tavo_osal_init(4, 4) != TAVO_SUCCESS) return 2;
+    if (tavo_msg_queue_init(7, &queue) != TAVO_SUCCESS) return 4;
     const pid_t client = fork();
     if (client == 0) {
         execl(program, program, "say", (char*)NULL);
         _exit(127);
     }
     if (client < 0 || waitpid(client, &status, 0) != client || status != 0) return 3;
-    if (tavo_msg_queue_init(7, &queue) != TAVO_SUCCESS) return 4;
     if (tavo_msg_queue_get(queue, message, &size) != TAVO_SUCCESS) return 5;
     printf("\nthe other process said %.*s\n", (int)size, (char*)message);
-    return 0;
+    return tavo_msg_queue_close(queue) == TAVO_SUCCESS ? 0 : 10;
 }
 
 static int say(void) {
@@ -32,7 +32,8 @@ static int say(void) {
     if (tavo_semaphore_acquire(semaphore) != TAVO_SUCCESS) return 7;
     if (tavo_msg_queue_init(7, &queue) != TAVO_SUCCESS) return 8;
     if (tavo_msg_queue_put(queue, hello, sizeof hello - 1) != TAVO_SUCCESS) return 9;
-    return 0; /* and leaves the queue's use, so that the message outlives this process */
+    if (tavo_semaphore_delete(semaphore) != TAVO_SUCCESS) return 11;
+    return tavo_msg_queue_close(queue) == TAVO_SUCCESS ? 0 : 12;
 }
 
 int main(int argc, char** argv) { return argc == 2 && strcmp(argv[1], "say") == 0 ? say() : serve(argv[0]); }

@@ -89,6 +89,7 @@ public:
 #ifdef TAVO_HAS_EXCEPTIONS
     /** @name The same, throwing std::system_error
      *  @{ */
+    /** As the one above with the same name and arguments; a failure is thrown as std::system_error. */
     void wait(std::unique_lock<Mutex>& lock) {
         detail::or_throw("tavo::Condition::wait", [&](std::error_code& error) { wait(lock, error); });
     }

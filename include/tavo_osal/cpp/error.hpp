@@ -65,39 +65,39 @@ namespace detail {
 
 struct StatusText {
     Errc code;
-    const char* text;
     std::errc condition; /* {} where the standard's conditions have nothing like it */
+    const char* text;
 };
 
 inline constexpr StatusText kStatusTexts[] = {
-    {Errc::write_failed, "the message could not be written", {}},
-    {Errc::not_reachable, "the service is not reachable", {}},
-    {Errc::failure, "a platform call failed, or the service is not reachable", {}},
-    {Errc::invalid_param, "invalid parameter", std::errc::invalid_argument},
-    {Errc::no_memory, "no memory, or no free place", std::errc::not_enough_memory},
-    {Errc::destroy_failed, "a part of the object could not be destroyed", {}},
-    {Errc::not_supported, "not supported on this platform", std::errc::not_supported},
-    {Errc::busy, "the mutex is held", std::errc::device_or_resource_busy},
-    {Errc::out_of_range, "the number does not fit in 32 bits", std::errc::result_out_of_range},
-    {Errc::timeout, "the wait timed out", std::errc::timed_out},
-    {Errc::socket_create_failed, "the socket could not be created", {}},
-    {Errc::socket_connect_failed, "the socket could not be connected, bound or accepted", {}},
-    {Errc::socket_close_failed, "the socket could not be closed, shut down or reset", {}},
-    {Errc::socket_select_timeout, "the wait for the socket timed out", std::errc::timed_out},
-    {Errc::socket_select_failed, "the wait for the socket failed", {}},
-    {Errc::socket_send_failed, "not everything was sent", {}},
-    {Errc::socket_option_failed, "the socket option could not be set", {}},
-    {Errc::queue_key_failed, "no message-queue key could be generated", {}},
-    {Errc::queue_invalid_pointer, "null handle or key", std::errc::invalid_argument},
-    {Errc::queue_failure, "no queue object, or a failed receive", {}},
-    {Errc::message_too_large, "the message is larger than a queue carries", std::errc::message_size},
-    {Errc::queue_not_available, "no such queue, or it was removed", std::errc::identifier_removed},
-    {Errc::condition_timeout, "the wait for the condition timed out", std::errc::timed_out},
-    {Errc::semaphore_delete_failed, "the semaphore could not be unmapped", {}},
-    {Errc::semaphore_timeout, "the wait for the semaphore timed out", std::errc::timed_out},
-    {Errc::dl_open_failed, "the shared object could not be loaded", {}},
-    {Errc::dl_symbol_failed, "the symbol was not found", {}},
-    {Errc::dl_close_failed, "the shared object could not be closed", {}},
+    {Errc::write_failed, {}, "the message could not be written"},
+    {Errc::not_reachable, {}, "the service is not reachable"},
+    {Errc::failure, {}, "a platform call failed, or the service is not reachable"},
+    {Errc::invalid_param, std::errc::invalid_argument, "invalid parameter"},
+    {Errc::no_memory, std::errc::not_enough_memory, "no memory, or no free place"},
+    {Errc::destroy_failed, {}, "a part of the object could not be destroyed"},
+    {Errc::not_supported, std::errc::not_supported, "not supported on this platform"},
+    {Errc::busy, std::errc::device_or_resource_busy, "the mutex is held"},
+    {Errc::out_of_range, std::errc::result_out_of_range, "the number does not fit in 32 bits"},
+    {Errc::timeout, std::errc::timed_out, "the wait timed out"},
+    {Errc::socket_create_failed, {}, "the socket could not be created"},
+    {Errc::socket_connect_failed, {}, "the socket could not be connected, bound or accepted"},
+    {Errc::socket_close_failed, {}, "the socket could not be closed, shut down or reset"},
+    {Errc::socket_select_timeout, std::errc::timed_out, "the wait for the socket timed out"},
+    {Errc::socket_select_failed, {}, "the wait for the socket failed"},
+    {Errc::socket_send_failed, {}, "not everything was sent"},
+    {Errc::socket_option_failed, {}, "the socket option could not be set"},
+    {Errc::queue_key_failed, {}, "no message-queue key could be generated"},
+    {Errc::queue_invalid_pointer, std::errc::invalid_argument, "null handle or key"},
+    {Errc::queue_failure, {}, "no queue object, or a failed receive"},
+    {Errc::message_too_large, std::errc::message_size, "the message is larger than a queue carries"},
+    {Errc::queue_not_available, std::errc::identifier_removed, "no such queue, or it was removed"},
+    {Errc::condition_timeout, std::errc::timed_out, "the wait for the condition timed out"},
+    {Errc::semaphore_delete_failed, {}, "the semaphore could not be unmapped"},
+    {Errc::semaphore_timeout, std::errc::timed_out, "the wait for the semaphore timed out"},
+    {Errc::dl_open_failed, {}, "the shared object could not be loaded"},
+    {Errc::dl_symbol_failed, {}, "the symbol was not found"},
+    {Errc::dl_close_failed, {}, "the shared object could not be closed"},
 };
 
 constexpr const StatusText* find_text(int value) noexcept {

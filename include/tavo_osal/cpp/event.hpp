@@ -53,6 +53,7 @@ public:
 #ifdef TAVO_HAS_EXCEPTIONS
     /** @name The same, throwing std::system_error
      *  @{ */
+    /** As the one above with the same name and arguments; a failure is thrown as std::system_error. */
     void set() {
         detail::or_throw("tavo::Event::set", [this](std::error_code& error) { set(error); });
     }

@@ -43,7 +43,9 @@ public:
     /** Takes over a handle made by the C function. */
     static Handle adopt(Object* handle) noexcept { return Handle(handle, Adopted()); }
 
+    /** Takes over what the other one owns, which is empty then. */
     Handle(Handle&& other) noexcept : handle_(other.release()) {}
+    /** Gives up its own, and takes over what the other one owns. */
     Handle& operator=(Handle&& other) noexcept {
         const Handle old(std::move(*this));
         handle_ = other.release();

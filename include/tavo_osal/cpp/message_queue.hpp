@@ -34,8 +34,10 @@ public:
         error = to_error_code(tavo_msg_queue_init(key, &handle_));
         if (error) handle_ = 0;
     }
+    /** Takes over what the other one owns, which is empty then. */
     MessageQueue(MessageQueue&& other) noexcept
         : handle_(std::exchange(other.handle_, 0)), scratch_(std::move(other.scratch_)) {}
+    /** Gives up its own, and takes over what the other one owns. */
     MessageQueue& operator=(MessageQueue&& other) noexcept {
         const MessageQueue old(std::move(*this));
         handle_ = std::exchange(other.handle_, 0);
@@ -93,6 +95,7 @@ public:
 #ifdef TAVO_HAS_EXCEPTIONS
     /** @name The same, throwing std::system_error
      *  @{ */
+    /** As the one above with the same name and arguments; a failure is thrown as std::system_error. */
     explicit MessageQueue(int key) {
         detail::or_throw("tavo::MessageQueue", [&](std::error_code& error) { *this = MessageQueue(key, error); });
     }

@@ -30,7 +30,9 @@ public:
                                                     : tavo_osal_semaphore_create(semaphore_.get(), 0, count));
         if (error) delete semaphore_.release();
     }
+    /** Takes over what the other one owns, which is empty then. */
     Semaphore(Semaphore&&) noexcept = default;
+    /** Gives up its own, and takes over what the other one owns. */
     Semaphore& operator=(Semaphore&&) noexcept = default;
 
     /** Destroys the semaphore now; nobody must be waiting. Does nothing when empty. @param error the failure */
@@ -92,6 +94,7 @@ public:
 #ifdef TAVO_HAS_EXCEPTIONS
     /** @name The same, throwing std::system_error
      *  @{ */
+    /** As the one above with the same name and arguments; a failure is thrown as std::system_error. */
     explicit Semaphore(uint32_t count) {
         detail::or_throw("tavo::Semaphore", [&](std::error_code& error) { *this = Semaphore(count, error); });
     }
@@ -158,7 +161,9 @@ public:
         if (status != TAVO_SUCCESS) handle_ = 0;
         error = to_error_code(status);
     }
+    /** Takes over what the other one owns, which is empty then. */
     ProcessSemaphore(ProcessSemaphore&& other) noexcept : handle_(std::exchange(other.handle_, 0)) {}
+    /** Gives up its own, and takes over what the other one owns. */
     ProcessSemaphore& operator=(ProcessSemaphore&& other) noexcept {
         const ProcessSemaphore old(std::move(*this));
         handle_ = std::exchange(other.handle_, 0);
@@ -176,6 +181,7 @@ public:
 #ifdef TAVO_HAS_EXCEPTIONS
     /** @name The same, throwing std::system_error
      *  @{ */
+    /** As the one above with the same name and arguments; a failure is thrown as std::system_error. */
     explicit ProcessSemaphore(uint32_t key) {
         detail::or_throw("tavo::ProcessSemaphore",
                          [&](std::error_code& error) { *this = ProcessSemaphore(key, error); });

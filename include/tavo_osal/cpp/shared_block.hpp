@@ -34,8 +34,10 @@ public:
         // Nothing was counted, so tavo_shm_delete() would take back somebody else's use.
         if (error) free_handle();
     }
+    /** Takes over what the other one owns, which is empty then. */
     SharedBlock(SharedBlock&& other) noexcept
         : handle_(std::exchange(other.handle_, nullptr)), data_(std::exchange(other.data_, nullptr)) {}
+    /** Gives up its own, and takes over what the other one owns. */
     SharedBlock& operator=(SharedBlock&& other) noexcept {
         const SharedBlock old(std::move(*this));
         handle_ = std::exchange(other.handle_, nullptr);
@@ -63,7 +65,7 @@ public:
     }
 
 #ifdef TAVO_HAS_EXCEPTIONS
-    /** Maps the block of a key. @throws std::system_error @param key as above @param size as above */
+    /** Maps the block of a key. @param key as above @param size as above @throws std::system_error */
     SharedBlock(uint32_t key, std::size_t size) {
         detail::or_throw("tavo::SharedBlock", [&](std::error_code& error) { *this = SharedBlock(key, size, error); });
     }

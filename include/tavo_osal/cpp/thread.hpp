@@ -5,8 +5,8 @@
 #ifndef TAVO_OSAL_CPP_THREAD_HPP
 #define TAVO_OSAL_CPP_THREAD_HPP
 
+#include <atomic>
 #include <functional>
-#include <memory>
 #include <new>
 #include <tuple>
 
@@ -19,6 +19,8 @@ namespace tavo {
 /**
  * A running thread. Movable, not copyable. The destructor, and assignment to a running one, wait until the thread has
  * ended. Operations on an empty object (moved from, joined, detached) fail with Errc::invalid_param.
+ *
+ * What the thread runs is destroyed when it is joined; when detached, with the thread.
  *
  * An exception that leaves the thread's function ends the program. Cancellation is the C library's affair, see
  * tavo_osal/thread.h: a thread that is cancelled should be waiting, since C++ code that is interrupted outside of
@@ -37,7 +39,7 @@ public:
         start(error, std::forward<Function>(function), std::forward<Arguments>(arguments)...);
     }
 #ifdef TAVO_HAS_EXCEPTIONS
-    /** Starts a thread. @throws std::system_error @param function as above @param arguments as above */
+    /** Starts a thread. @param function as above @param arguments as above @throws std::system_error */
     template <typename Function, typename... Arguments,
               std::enable_if_t<std::is_invocable_v<std::decay_t<Function>, std::decay_t<Arguments>...>, int> = 0>
     explicit Thread(Function&& function, Arguments&&... arguments) {
@@ -46,9 +48,15 @@ public:
         });
     }
 #endif
-    Thread(Thread&& other) noexcept : thread_(other.thread_), joinable_(std::exchange(other.joinable_, false)) {}
+    /** Takes over what the other one owns, which is empty then. */
+    Thread(Thread&& other) noexcept
+        : start_(std::exchange(other.start_, nullptr)),
+          thread_(other.thread_),
+          joinable_(std::exchange(other.joinable_, false)) {}
+    /** Gives up its own, and takes over what the other one owns. */
     Thread& operator=(Thread&& other) noexcept {
-        const Thread old(std::move(*this));
+        Thread old(std::move(*this));
+        start_ = std::exchange(other.start_, nullptr);
         thread_ = other.thread_;
         joinable_ = std::exchange(other.joinable_, false);
         return *this;
@@ -56,13 +64,22 @@ public:
     Thread(const Thread&) = delete;
     Thread& operator=(const Thread&) = delete;
     ~Thread() {
-        if (joinable_) tavo_osal_thread_join(thread_);
+        std::error_code ignored;
+        if (joinable_) join(ignored);
     }
 
     /** Waits until the thread has ended. @param error the failure, or cleared; after a failure it is still joinable */
-    void join(std::error_code& error) { part(tavo_osal_thread_join, error); }
+    void join(std::error_code& error) {
+        error = to_error_code(joinable_ ? tavo_osal_thread_join(thread_) : kEmpty);
+        if (!error) gone();
+    }
     /** Lets the thread run on by itself. @param error the failure, or cleared */
-    void detach(std::error_code& error) { part(tavo_osal_thread_detach, error); }
+    void detach(std::error_code& error) {
+        error = to_error_code(joinable_ ? tavo_osal_thread_detach(thread_) : kEmpty);
+        if (error) return;
+        joinable_ = false;
+        std::exchange(start_, nullptr)->leave();
+    }
     /** Asks the thread to end where it is, see above; join it to know that it has. @param error the failure */
     void cancel(std::error_code& error) {
         error = to_error_code(joinable_ ? tavo_osal_thread_cancel(thread_) : kEmpty);
@@ -76,6 +93,7 @@ public:
 #ifdef TAVO_HAS_EXCEPTIONS
     /** @name The same, throwing std::system_error
      *  @{ */
+    /** As the one above with the same name and arguments; a failure is thrown as std::system_error. */
     void join() {
         detail::or_throw("tavo::Thread::join", [this](std::error_code& error) { join(error); });
     }
@@ -100,31 +118,56 @@ public:
 private:
     static constexpr TAVO_Status kEmpty = TAVO_INVALID_PARAM;
 
+    /* What the thread runs. Belongs to the thread object, for a thread that is cancelled ends in a signal handler,
+     * where nothing can be freed; when detached, to whoever is the second of thread and object to be done with it. */
+    struct Start {
+        virtual ~Start() = default;
+        virtual void run() = 0;
+        std::atomic<bool> left{false};
+
+        void leave() {
+            if (left.exchange(true)) delete this;
+        }
+    };
     template <typename Call>
+    struct StartOf final : Start {
+        explicit StartOf(Call&& made) : call(std::move(made)) {}
+        void run() override {
+            std::apply(
+                [](auto&& function, auto&&... values) {
+                    std::invoke(std::forward<decltype(function)>(function), std::forward<decltype(values)>(values)...);
+                },
+                std::move(call));
+        }
+        Call call;
+    };
+
     static void* run(void* argument) {
-        const std::unique_ptr<Call> call(static_cast<Call*>(argument));
-        std::apply([](auto&& function, auto&&... values) { std::invoke(std::move(function), std::move(values)...); },
-                   std::move(*call));
+        auto* start = static_cast<Start*>(argument);
+        start->run();
+        start->leave();
         return nullptr;
+    }
+
+    /* The thread is, and what it ran may go. */
+    void gone() {
+        joinable_ = false;
+        delete std::exchange(start_, nullptr);
     }
 
     template <typename Function, typename... Arguments>
     void start(std::error_code& error, Function&& function, Arguments&&... arguments) {
         using Call = std::tuple<std::decay_t<Function>, std::decay_t<Arguments>...>;
-        std::unique_ptr<Call> call(new (std::nothrow)
-                                       Call(std::forward<Function>(function), std::forward<Arguments>(arguments)...));
+        start_ = new (std::nothrow)
+            StartOf<Call>(Call(std::forward<Function>(function), std::forward<Arguments>(arguments)...));
         TAVO_Status status = TAVO_NO_MEMORY;
-        if (call != nullptr) status = tavo_osal_thread_create(&thread_, run<Call>, call.get());
+        if (start_ != nullptr) status = tavo_osal_thread_create(&thread_, run, start_);
         joinable_ = status == TAVO_SUCCESS;
-        if (joinable_) static_cast<void>(call.release());  // the thread's, by now
+        if (!joinable_) delete std::exchange(start_, nullptr);
         error = to_error_code(status);
     }
 
-    void part(TAVO_Status (*parting)(pthread_t), std::error_code& error) {
-        error = to_error_code(joinable_ ? parting(thread_) : kEmpty);
-        if (!error) joinable_ = false;
-    }
-
+    Start* start_ = nullptr; /* while joinable */
     pthread_t thread_ = {};
     bool joinable_ = false;
 };

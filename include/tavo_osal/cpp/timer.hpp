@@ -97,7 +97,9 @@ public:
         error = to_error_code(tavo_osal_timer_framework_init(framework_->tick_ms, &framework_->handle));
         if (error) framework_ = nullptr;
     }
+    /** Takes over what the other one owns, which is empty then. */
     Timers(Timers&&) noexcept = default;
+    /** Gives up its own, and takes over what the other one owns. */
     Timers& operator=(Timers&& other) noexcept {
         const Timers old(std::move(*this));
         framework_ = std::move(other.framework_);
@@ -120,7 +122,7 @@ public:
     }
 
 #ifdef TAVO_HAS_EXCEPTIONS
-    /** Starts a worker. @throws std::system_error @param tick as above */
+    /** Starts a worker. @param tick as above @throws std::system_error */
     template <typename Rep, typename Period>
     explicit Timers(std::chrono::duration<Rep, Period> tick) {
         detail::or_throw("tavo::Timers", [&](std::error_code& error) { *this = Timers(tick, error); });
@@ -150,7 +152,8 @@ private:
  * fires one tick after its duration has passed, as the worker counts it.
  *
  * Freeing a timer does not wait for its callback, which may be running on the worker: what a callback refers to has to
- * stay until the Timers has ended. The callback itself is kept while it runs.
+ * stay until the Timers has ended. The callback itself is kept while it runs. Callbacks
+ * are not to be cancelled (tavo_osal_thread_cancel()).
  */
 class Timer {
 public:
@@ -184,7 +187,9 @@ public:
             static_cast<int>(interval_ms_), detail::Callbacks::call, reinterpret_cast<void*>(number_), &timer_));
         if (error) give_back();
     }
+    /** Takes over what the other one owns, which is empty then. */
     Timer(Timer&& other) noexcept { take(other); }
+    /** Gives up its own, and takes over what the other one owns. */
     Timer& operator=(Timer&& other) noexcept {
         const Timer old(std::move(*this));
         take(other);
@@ -216,6 +221,7 @@ public:
 #ifdef TAVO_HAS_EXCEPTIONS
     /** @name The same, throwing std::system_error
      *  @{ */
+    /** As the one above with the same name and arguments; a failure is thrown as std::system_error. */
     template <typename Rep, typename Period>
     Timer(Timers& timers, Kind kind, std::chrono::duration<Rep, Period> interval, std::function<void()> callback) {
         detail::or_throw("tavo::Timer", [&](std::error_code& error) {

@@ -57,7 +57,7 @@ public:
     /**
      * Begins to count. Ends the program with a message when nobody calls the function, since the test would pass for
      * nothing.
-     * @param nth    1 for the next call and so on, or #kEveryCall, or #kNoCall
+     * @param nth    1 for the next call and so on, or tavo::test::kEveryCall, or tavo::test::kNoCall
      * @param result what the call returns, such as #TAVO_NO_MEMORY or a null pointer
      */
     FailingCall(unsigned nth, Result result)
