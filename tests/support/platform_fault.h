@@ -7,6 +7,9 @@
 //
 //     PlatformHook hook("libtavoosal.so", "pipe2", +[](int*, int) { errno = EMFILE; return -1; });
 //
+// The checked variants of poll and read, which optimised builds call, are redirected with them: the one argument more
+// that they have comes last.
+//
 // Replacements are plain functions; keep what they need in statics. Hooks are not for use while other
 // threads run in the hooked object.
 #pragma once
@@ -28,6 +31,9 @@ public:
     PlatformHook(const char* object, const char* function, Result (*replacement)(Arguments..., ...))
         : PlatformHook(object, function, reinterpret_cast<void*>(replacement)) {}
     ~PlatformHook();
+    // Whether the object imports the function by this name. Optimised builds call checked variants of some, with other
+    // arguments: a replacement for __snprintf_chk is not one for snprintf.
+    static bool imports(const char* object, const char* function);
     PlatformHook(const PlatformHook&) = delete;
     PlatformHook& operator=(const PlatformHook&) = delete;
 
