@@ -140,7 +140,7 @@ TAVO_INT64 handle_of(const sem_t* sem) { return reinterpret_cast<intptr_t>(sem);
 sem_t* semaphore_of(TAVO_INT64 handle) { return reinterpret_cast<sem_t*>(static_cast<intptr_t>(handle)); }
 
 // Neither 0, for nothing, nor -1, for what could not be mapped, is a semaphore: the platform would be killed by them.
-bool is_semaphore(TAVO_INT64 handle) { return static_cast<uint64_t>(handle) + 1 > 1; }
+bool is_semaphore(const sem_t* sem) { return sem != nullptr && sem != MAP_FAILED; }
 
 [[gnu::cold, gnu::noinline]] TAVO_Status failed(const char* message, int line = __builtin_LINE()) {
     TAVO_LOG_AT(line, kTag, TAVO_LOG_ERROR, "%s", message);
@@ -177,26 +177,28 @@ TAVO_Status tavo_semaphore_init(uint32_t uiKey, TAVO_INT64* piSem) {
 }
 
 TAVO_Status tavo_semaphore_acquire(TAVO_INT64 iSem) {
-    if (!is_semaphore(iSem)) {
+    sem_t* sem = semaphore_of(iSem);
+    if (!is_semaphore(sem)) {
         errno = EINVAL;
-    } else if (sem_wait(semaphore_of(iSem)) == 0) {
+    } else if (sem_wait(sem) == 0) {
         return TAVO_SUCCESS;
     }
     return failed("Semaphore Wait failed !");
 }
 
 TAVO_Status tavo_semaphore_release(TAVO_INT64 iSem) {
-    if (!is_semaphore(iSem)) {
+    sem_t* sem = semaphore_of(iSem);
+    if (!is_semaphore(sem)) {
         errno = EINVAL;
-    } else if (sem_post(semaphore_of(iSem)) == 0) {
+    } else if (sem_post(sem) == 0) {
         return TAVO_SUCCESS;
     }
     return failed("Release failed !");
 }
 
 TAVO_Status tavo_semaphore_delete(TAVO_INT64 iSem) {
-    if (iSem == 0) return TAVO_SUCCESS;
-    if (munmap(semaphore_of(iSem), sizeof(sem_t)) == 0) return TAVO_SUCCESS;
+    sem_t* sem = semaphore_of(iSem);
+    if (sem == nullptr || munmap(sem, sizeof(sem_t)) == 0) return TAVO_SUCCESS;
     TAVO_LOG(kTag, TAVO_LOG_ERROR, "Deleting the semaphore failed. errno is 0x%x.\n", static_cast<unsigned>(errno));
     return TAVO_SEM_DELETE_FAILED;
 }

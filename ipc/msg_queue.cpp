@@ -29,9 +29,13 @@ constexpr TAVO_Status kServiceUnreachable = 1;
 // Descriptor 0 stands for an absent one in message queues, so no queue may be given it.
 constexpr int kLowestDescriptor = 1;
 
-// Addresses are sign-extended, as 32-bit callers store them.
-TAVO_INT64 handle_of(const TAVO_MessageQueue* queue) { return reinterpret_cast<intptr_t>(queue); }
+// A handle is the queue's address, and positive: only such a handle can be given back, so an address in the upper half
+// of a 32-bit address space is not extended by its sign.
+TAVO_INT64 handle_of(const TAVO_MessageQueue* queue) {
+    return static_cast<TAVO_INT64>(reinterpret_cast<uintptr_t>(queue));
+}
 
+// The address is in the low bits, however the caller has stored it.
 TAVO_MessageQueue* queue_of(TAVO_INT64 handle) {
     return reinterpret_cast<TAVO_MessageQueue*>(static_cast<intptr_t>(handle));
 }

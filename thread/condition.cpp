@@ -10,6 +10,7 @@
 #include "tavo_osal/memory.h"
 #include "thread/cancellation.h"
 #include "thread/platform_call.h"
+#include "thread/seconds.h"
 
 struct TAVO_Condition {
     pthread_cond_t platform;
@@ -40,7 +41,7 @@ int wait(TAVO_Condition& condition, TAVO_Mutex& mutex, const timespec* deadline)
 // No carry from the nanoseconds into the seconds: callers depend on the failure of the waits this rules out.
 timespec deadline_after(const timeval& now, uint64_t timeout_ms) {
     timespec deadline = {};
-    deadline.tv_sec = now.tv_sec + static_cast<time_t>(timeout_ms / 1000);
+    deadline.tv_sec = tavo::seconds_after(now.tv_sec, timeout_ms / 1000);
     deadline.tv_nsec = static_cast<long>(now.tv_usec * 1000) + static_cast<long>(timeout_ms % 1000) * 1000000L;
     return deadline;
 }

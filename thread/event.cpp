@@ -12,6 +12,7 @@
 #include "tavo_osal/memory.h"
 #include "thread/cancellation.h"
 #include "thread/platform_call.h"
+#include "thread/seconds.h"
 
 struct TAVO_Event {
     uint32_t count;
@@ -90,7 +91,7 @@ TAVO_Status wait_for_seconds(TAVO_Event& event, uint32_t seconds, bool all, cons
     TAVO_Status status = TAVO_SUCCESS;
     if (event.count == 0) {
         timespec deadline = {};
-        deadline.tv_sec = now.tv_sec + static_cast<time_t>(seconds);
+        deadline.tv_sec = tavo::seconds_after(now.tv_sec, seconds);
         deadline.tv_nsec = static_cast<long>(now.tv_usec * 1000);
         const int error = sleep_on(event, &deadline);
         if (error == ETIMEDOUT) {

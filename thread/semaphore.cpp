@@ -5,6 +5,7 @@
 
 #include "log/module_log.h"
 #include "thread/platform_call.h"
+#include "thread/seconds.h"
 
 namespace {
 
@@ -36,7 +37,7 @@ TAVO_Status tavo_osal_semaphore_wait(sem_t* pSemaphore) {
 TAVO_Status tavo_osal_semaphore_timedwait(sem_t* pSemaphore, uint64_t uiDeadlineMs) {
     // A point in time, and no current time is added to it: callers pass one.
     timespec deadline = {};
-    deadline.tv_sec = static_cast<time_t>(uiDeadlineMs / 1000);
+    deadline.tv_sec = tavo::seconds_after(0, uiDeadlineMs / 1000);
     deadline.tv_nsec = static_cast<long>(uiDeadlineMs % 1000) * 1000000L;
     const TAVO_Status status =
         checked_errno(kTag, sem_timedwait(pSemaphore, &deadline), "Semaphore timewait failed with errno %d\n");

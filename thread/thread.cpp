@@ -11,6 +11,7 @@
 #include "log/module_log.h"
 #include "thread/known_threads.h"
 #include "thread/platform_call.h"
+#include "thread/seconds.h"
 
 namespace {
 
@@ -50,7 +51,7 @@ TAVO_Status tavo_osal_thread_sleep(uint32_t uiSeconds) {
 
 TAVO_Status tavo_osal_thread_msleep(uint64_t uiMilliSeconds) {
     timespec duration = {};
-    duration.tv_sec = static_cast<time_t>(uiMilliSeconds / 1000);
+    duration.tv_sec = tavo::seconds_after(0, uiMilliSeconds / 1000);
     duration.tv_nsec = static_cast<long>(uiMilliSeconds % 1000) * 1000000L;
     return checked_errno(kTag, nanosleep(&duration, nullptr),
                          "nanosleep failed, this may be because of signal handler or other reasons. errno %d\n");

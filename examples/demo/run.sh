@@ -12,7 +12,9 @@ trap 'kill "${pids[@]}" 2>/dev/null || true' EXIT
 
 start() { # ROLE: starts it with its output and its log in files of their own
     : >"$output/$1.out"
-    "$programs/demo_$1" >"$output/$1.out" 2>"$output/$1.log" &
+    # The programs may be another architecture's.
+    # shellcheck disable=SC2086
+    ${TAVO_EMULATOR-} "$programs/demo_$1" >"$output/$1.out" 2>"$output/$1.log" &
     pids+=($!)
 }
 

@@ -3,6 +3,7 @@
 
 #include <cstdlib>
 #include <new>
+#include <string>
 #include <vector>
 
 #include "support/platform_fault.h"
@@ -40,13 +41,13 @@ private:
     }
 
     static const char* name_of(Function function) {
-        constexpr bool kWide = sizeof(size_t) == sizeof(unsigned long) && sizeof(size_t) != sizeof(unsigned);
+        static const std::string nothrow_new = std::string(kOperatorNew) + "RKSt9nothrow_t";
         switch (function) {
             case kMalloc: return "malloc";
             case kCalloc: return "calloc";
             case kRealloc: return "realloc";
-            case kNew: return kWide ? "_Znwm" : "_Znwj";
-            default: return kWide ? "_ZnwmRKSt9nothrow_t" : "_ZnwjRKSt9nothrow_t";
+            case kNew: return kOperatorNew;
+            default: return nothrow_new.c_str();
         }
     }
     static void* replacement_of(Function function) {

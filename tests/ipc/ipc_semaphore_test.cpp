@@ -16,6 +16,7 @@
 #include <fstream>
 #include <string>
 #include <thread>
+#include <vector>
 
 #include "ipc/ipc_semaphore_test.h"
 #include "support/log_capture.h"
@@ -200,17 +201,17 @@ TEST(IpcSemaphore, ReportsAReleaseThatWouldOverflow) {
 }
 
 TEST(IpcSemaphore, FailsForHandlesThatAreNone) {
-    const LogCapture log;
-    for (const TAVO_INT64 handle : {TAVO_INT64{0}, TAVO_INT64{-1}}) {
+    std::vector<TAVO_INT64> handles = {0, -1};
+    // Callers may have kept the same in 32 unsigned bits, or may pass what is no address at all.
+    if (sizeof(void*) == 4) handles.insert(handles.end(), {0xFFFFFFFF, 0x100000000});
+    for (const TAVO_INT64 handle : handles) {
+        const LogCapture log;
         errno = 0;
         EXPECT_EQ(tavo_semaphore_acquire(handle), TAVO_FAILURE);
         EXPECT_EQ(errno, EINVAL);
         EXPECT_EQ(tavo_semaphore_release(handle), TAVO_FAILURE);
+        EXPECT_TRUE(logged_exactly(log.lines(), {{1, kTag, "Semaphore Wait failed !"}, {1, kTag, "Release failed !"}}));
     }
-    EXPECT_TRUE(logged_exactly(log.lines(), {{1, kTag, "Semaphore Wait failed !"},
-                                             {1, kTag, "Release failed !"},
-                                             {1, kTag, "Semaphore Wait failed !"},
-                                             {1, kTag, "Release failed !"}}));
 }
 
 struct Waiter {

@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "message_queue_test.h"
+#include "support/pace.h"
 #include "support/process.h"
 
 namespace {
@@ -20,12 +21,8 @@ namespace {
 using android::TAVO_MessageQueue;
 using namespace tavo::test;
 
-// Sanitizers slow the copies and comparisons down, not the pipe: a twentieth shows the same.
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr uint64_t kShare = 20;
-#else
-constexpr uint64_t kShare = 1;
-#endif
+// Sanitizers and emulators slow the copies and comparisons down, not the pipe: a twentieth shows the same.
+uint64_t share() { return is_slow() ? 20 : 1; }
 
 std::vector<int> allowed_cpus() {
     cpu_set_t set;
@@ -131,7 +128,7 @@ TEST_P(MessageQueueStream, DeliversEveryMessageWhole) {
     const Affinity kept;
     const std::vector<int> cpus = allowed_cpus();
     if (stream.two_cpus && cpus.size() < 2) GTEST_SKIP() << "only one CPU may be used";
-    const uint64_t count = stream.count / kShare;
+    const uint64_t count = stream.count / share();
     const int writers_cpu = stream.two_cpus ? cpus.back() : cpus.front();
 
     TAVO_MessageQueue queue;
@@ -160,7 +157,7 @@ INSTANTIATE_TEST_SUITE_P(TwoCpus, MessageQueueStream,
                                          Stream{409600, 1000, true, "default"}));
 
 // Sizes from the smallest to the largest that goes out in one atomic write.
-size_t small_size(uint64_t number) { return 16 + number * 37 % (4092 - 16 + 1); }
+size_t small_size(uint64_t number) { return static_cast<size_t>(16 + number * 37 % (4092 - 16 + 1)); }
 
 void fill_small(unsigned char* message, uint64_t writer, uint64_t number) {
     memcpy(message, &writer, sizeof writer);

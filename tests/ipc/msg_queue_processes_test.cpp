@@ -30,7 +30,7 @@ size_t mixed_size(uint32_t index) {
     return kSizes[index % std::size(kSizes)];
 }
 // In one atomic write, so that several senders may send them.
-size_t small_size(uint32_t index) { return index % 100 == 0 ? 4092 : 8 + mix(index) % 200; }
+size_t small_size(uint32_t index) { return index % 100 == 0 ? 4092 : 8 + static_cast<size_t>(mix(index) % 200); }
 
 // A message that says who sent it and which it is, and is otherwise as good as random.
 std::string message_of(uint32_t sender, uint32_t index, size_t size) {
@@ -69,9 +69,11 @@ TEST_ROLE(sender) {
     return tavo_msg_queue_destroy(handle) == TAVO_SUCCESS ? 0 : 2;
 }
 
-// KEY SENDERS COUNT SIZES: receives so many messages of each sender, in each one's order and to the byte.
+// KEY SENDERS COUNT SIZES: says when it is attached, and then receives so many messages of each sender, in each one's
+// order and to the byte.
 TEST_ROLE(receiver) {
     const TAVO_INT64 handle = attached(arguments.at(0));
+    std::cout << "attached" << std::endl;
     const auto senders = static_cast<uint32_t>(std::stoul(arguments.at(1)));
     const auto count = static_cast<uint32_t>(std::stoul(arguments.at(2)));
     const Size size = size_called(arguments.at(3));
@@ -116,6 +118,7 @@ TEST_F(QueueProcesses, CarryMessagesOfAllSizesInOrder) {
     Process receiver = Process::start("receiver", {"7", "1", "240", "mixed"});
     Process sender = Process::start("sender", {"7", "0", "240", "mixed"});
     const std::string sent = sender.read_line();
+    EXPECT_EQ(receiver.read_line(), "attached");
     EXPECT_EQ(receiver.read_line(), sent);
     EXPECT_NE(sent, "");
     EXPECT_EQ(sender.wait(), 0);
@@ -187,7 +190,7 @@ TEST_F(QueueProcesses, KeepTheUsesOfOnesThatDied) {
 TEST_F(QueueProcesses, ShareThePipeAfterTheServerDied) {
     const TAVO_INT64 handle = attached("7");
     Process receiver = Process::start("receiver", {"7", "1", "50", "mixed"});
-    while (count_pipe_ends(file_of(queue_of(handle).iReadFd), receiver.pid()) < 2) usleep(1000);
+    ASSERT_EQ(receiver.read_line(), "attached");
     server_.kill();
     for (uint32_t i = 0; i < 50; ++i) ASSERT_EQ(put(handle, message_of(0, i, mixed_size(i))), TAVO_SUCCESS);
     EXPECT_NE(receiver.read_line(), "");

@@ -223,7 +223,7 @@ TEST(SharedMemoryAcquire, FailsWhicheverAllocationOfTheLibraryFails) {
         TavoShmHandle handle = {7, 100};
         void* address = kUntouched;
         g_allocations_left = allocations;
-        const PlatformHook hook("libtavoosal.so", "_Znwm", allocate_or_throw);
+        const PlatformHook hook("libtavoosal.so", tavo::test::kOperatorNew, allocate_or_throw);
         status = tavo_shm_acquire(&handle, &address);
         if (status == TAVO_SUCCESS) continue;
         ++failures;

@@ -2,6 +2,7 @@
 
 #include <dirent.h>
 #include <fcntl.h>
+#include <limits.h>
 #include <signal.h>
 #include <spawn.h>
 #include <sys/wait.h>
@@ -12,7 +13,9 @@
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
+#include <iterator>
 #include <map>
+#include <sstream>
 #include <utility>
 
 namespace tavo::test {
@@ -39,7 +42,21 @@ size_t count_entries(const std::string& path) {
     return count;
 }
 
+// How this program was started, or would have to be: through the emulator that runs it, if there is one.
+std::vector<std::string> command_of_this_program() {
+    constexpr char kSelf[] = "/proc/self/exe";
+    if (emulator() == nullptr) return {kSelf};
+    std::istringstream words(emulator());
+    std::vector<std::string> command{std::istream_iterator<std::string>(words), {}};
+    char path[PATH_MAX];
+    const ssize_t length = readlink(kSelf, path, sizeof path);  // the program's, emulators see to that
+    command.emplace_back(path, length > 0 ? static_cast<size_t>(length) : 0);
+    return command;
+}
+
 }  // namespace
+
+const char* emulator() { return getenv("TAVO_EMULATOR"); }
 
 RoleRegistration::RoleRegistration(const char* name, Role role) { roles()[name] = role; }
 
@@ -83,10 +100,12 @@ Process Process::start(const std::string& role, const std::vector<std::string>& 
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_adddup2(&actions, in[0], STDIN_FILENO);
     posix_spawn_file_actions_adddup2(&actions, out[1], STDOUT_FILENO);
-    char path[] = "/proc/self/exe";
-    char* argv[] = {path, nullptr};
+    std::vector<std::string> words = command_of_this_program();
+    std::vector<char*> argv;
+    for (std::string& word : words) argv.push_back(word.data());
+    argv.push_back(nullptr);
     pid_t pid = -1;
-    const int error = posix_spawn(&pid, path, &actions, nullptr, argv, environment.data());
+    const int error = posix_spawnp(&pid, argv[0], &actions, nullptr, argv.data(), environment.data());
     posix_spawn_file_actions_destroy(&actions);
     close(in[0]);
     close(out[1]);
@@ -153,7 +172,10 @@ size_t count_descriptors(pid_t pid) {
     return pid == 0 || pid == getpid() ? count - 1 : count;
 }
 
-size_t count_threads(pid_t pid) { return count_entries(proc_path(pid, "task")); }
+size_t count_threads(pid_t pid) {
+    // QEMU's user emulator has one thread for itself.
+    return count_entries(proc_path(pid, "task")) - (emulator() != nullptr ? 1 : 0);
+}
 
 size_t count_mappings(pid_t pid, const std::string& containing) {
     std::ifstream maps(proc_path(pid, "maps"));

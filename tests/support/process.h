@@ -20,6 +20,9 @@ struct RoleRegistration {
     RoleRegistration(const char* name, Role role);
 };
 
+// The command that programs of this one's kind are run with, where the machine cannot run them by itself; else null.
+const char* emulator();
+
 // Runs the role this process was started for and exits with its result; returns when there is none.
 void run_role_if_asked();
 

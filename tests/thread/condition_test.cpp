@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <chrono>
 #include <cstdlib>
+#include <limits>
 #include <thread>
 
 #include "asleep.h"
@@ -211,6 +212,19 @@ TEST_F(Condition, TimedWaitTakesA64BitTimeout) {
     EXPECT_EQ(timed_wait(0x100000000ULL), TAVO_CONDITION_TIMEOUT);
     EXPECT_EQ(g_deadline.tv_sec, 1 + 4294967);
     EXPECT_EQ(g_deadline.tv_nsec, 296000000L);
+}
+
+TEST_F(Condition, TimedWaitBeyondThePlatformsTimeLastsAsLongAsAnyCan) {
+    const PlatformHook clock(kLibrary, "gettimeofday", &given_time);
+    const PlatformHook wait(kLibrary, "pthread_cond_timedwait", &note_deadline);
+    constexpr time_t kLast = std::numeric_limits<time_t>::max();
+    g_now = {kLast - 5, 0};
+    EXPECT_EQ(timed_wait(4999), TAVO_CONDITION_TIMEOUT);
+    EXPECT_EQ(g_deadline.tv_sec, kLast - 1);
+    EXPECT_EQ(timed_wait(6000), TAVO_CONDITION_TIMEOUT);
+    EXPECT_EQ(g_deadline.tv_sec, kLast);
+    EXPECT_EQ(timed_wait(UINT64_MAX), TAVO_CONDITION_TIMEOUT);
+    EXPECT_EQ(g_deadline.tv_sec, kLast);
 }
 
 TEST_F(Condition, TimedWaitWhoseNanosecondsReachASecondFailsInsteadOfWaiting) {

@@ -5,6 +5,7 @@
 
 #include <cerrno>
 #include <chrono>
+#include <limits>
 #include <thread>
 
 #include "asleep.h"
@@ -126,6 +127,15 @@ TEST_F(EventWait, WaitsForWholeSecondsOnly) {
     EXPECT_EQ(tavo_osal_event_waitset(event_, 1999), TAVO_TIMEOUT);
     EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::milliseconds(900));
     EXPECT_TRUE(logged_exactly(log.lines(), {{3, kTag, "Time out happened.\n"}}));
+}
+
+TEST_F(EventWait, DeadlineIsAtMostTheLastSecondThePlatformCounts) {
+    const PlatformHook clock(kLibrary, "gettimeofday", &given_time);
+    const PlatformHook wait(kLibrary, "pthread_cond_timedwait", &time_out);
+    constexpr time_t kLast = std::numeric_limits<time_t>::max();
+    g_now = {kLast - 5, 0};
+    EXPECT_EQ(tavo_osal_event_waitset(event_, 0xFFFFFFFEU), TAVO_TIMEOUT);
+    EXPECT_EQ(g_deadline.tv_sec, kLast);
 }
 
 TEST_F(EventWait, DeadlineIsTheTimeOfDayPlusWholeSeconds) {

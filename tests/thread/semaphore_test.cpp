@@ -8,11 +8,13 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <climits>
 #include <cstdio>
 #include <ctime>
+#include <limits>
 #include <string>
 #include <thread>
 
@@ -155,6 +157,8 @@ TEST_F(Semaphore, TimedWaitConvertsTheDeadlineFieldByField) {
     EXPECT_EQ(tavo_osal_semaphore_timedwait(&semaphore_, 1700000000999ULL), TAVO_SUCCESS);
     EXPECT_EQ(deadline.tv_sec, 1700000000);
     EXPECT_EQ(deadline.tv_nsec, 999000000L);
+    EXPECT_EQ(tavo_osal_semaphore_timedwait(&semaphore_, UINT64_MAX), TAVO_SUCCESS);
+    EXPECT_EQ(deadline.tv_sec, std::min<int64_t>(UINT64_MAX / 1000, std::numeric_limits<time_t>::max()));
 }
 
 TEST_F(Semaphore, PostReportsACountThatIsTooLarge) {

@@ -249,6 +249,16 @@ TEST(ThreadHandle, WhereRunningThreadsCannotBeToldAJoinedHandleStaysDead) {
     EXPECT_TRUE(logged_exactly(log.lines(), {{1, kTag, "Thread join failed. iRet=3\n"}}));
 }
 
+TEST(ThreadHandle, WhereRunningThreadsCannotBeToldErrnoStaysTheCallers) {
+    const PlatformHook hook(kLibrary, "syscall", &answer_no_system_call);
+    const pthread_t thread = joined_thread();
+    const LogCapture log;
+    errno = ENOTTY;
+    EXPECT_EQ(tavo_osal_thread_set_real_time_priority(thread, 5, 1), TAVO_FAILURE);
+    EXPECT_TRUE(logged_exactly(
+        log.lines(), {{2, kTag, "pthread_getschedparam failed\n"}, {1, kTag, "Set sched_param failed. errno 25\n"}}));
+}
+
 TEST(ThreadHandle, WhereRunningThreadsCannotBeToldADetachedHandleCannotBeJoinedAndIsCancelledThroughThePlatform) {
     const PlatformHook hook(kLibrary, "syscall", &answer_no_system_call);
     Bedside bedside;
@@ -263,8 +273,8 @@ TEST(ThreadHandle, WhereRunningThreadsCannotBeToldADetachedHandleCannotBeJoinedA
     bedside.wait_until_gone();
 }
 
-// Values that are nobody's handles, with a platform that takes them.
-pthread_t made_up(uintptr_t number) { return static_cast<pthread_t>(number << 32); }
+// Values that are nobody's handles, as addresses in the first page, with a platform that takes them.
+pthread_t made_up(uintptr_t number) { return static_cast<pthread_t>(number); }
 
 TEST(ThreadHandle, TheLatest1024JoinedHandlesAreRemembered) {
     static int touched;

@@ -2,10 +2,12 @@
 #include <signal.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <ctime>
 #include <functional>
+#include <limits>
 #include <thread>
 
 #include "asleep.h"
@@ -83,6 +85,13 @@ TEST(ThreadSleep, MillisecondsAreOneNanosleepWithoutARemainder) {
     EXPECT_EQ(tavo_osal_thread_msleep(0x100000000ULL), TAVO_SUCCESS);
     EXPECT_EQ(g_duration.tv_sec, 4294967);
     EXPECT_EQ(g_duration.tv_nsec, 296000000L);
+}
+
+TEST(ThreadSleep, MoreMillisecondsThanThePlatformCountsSecondsOfAreTheLongestSleepThereIs) {
+    const PlatformHook hook(kLibrary, "nanosleep", &note_duration);
+    EXPECT_EQ(tavo_osal_thread_msleep(UINT64_MAX), TAVO_SUCCESS);
+    EXPECT_EQ(g_duration.tv_sec, std::min<int64_t>(UINT64_MAX / 1000, std::numeric_limits<time_t>::max()));
+    EXPECT_EQ(g_duration.tv_nsec, 615000000L);
 }
 
 TEST(ThreadSleep, MicrosecondsArePassedOn) {

@@ -35,10 +35,10 @@ BnMemoryHeap::~BnMemoryHeap() = default;
 status_t BnMemoryHeap::onTransact(uint32_t code, const Parcel& data, Parcel* reply, uint32_t flags) {
     if (code != HEAP_ID) return BBinder::onTransact(code, data, reply, flags);
     CHECK_INTERFACE(IMemoryHeap, data, reply);
-    const size_t size = getSize();
-    if (uint64_t{size} > UINT32_MAX) return BAD_VALUE;
+    const auto size = static_cast<uint32_t>(getSize());
+    if (size != getSize()) return BAD_VALUE;
     reply->writeFileDescriptor(getHeapID());
-    reply->writeUint32(static_cast<uint32_t>(size));
+    reply->writeUint32(size);
     reply->writeUint32(getFlags());
     return reply->writeUint32(getOffset());
 }

@@ -60,8 +60,10 @@ MemoryHeapBase::MemoryHeapBase(int fd, size_t size, uint32_t flags, uint32_t off
         return;
     }
     struct stat status = {};
-    if (size == 0 && fstat(mFD, &status) == 0 && status.st_size > static_cast<off_t>(offset)) {
-        size = static_cast<size_t>(status.st_size - static_cast<off_t>(offset));
+    if (size == 0 && fstat(mFD, &status) == 0) {
+        // Offsets may go further than the platform's own type for them.
+        const auto end = static_cast<uint64_t>(status.st_size);
+        if (end > offset) size = static_cast<size_t>(end - offset);
     }
     if (!map(size, offset)) dispose();
 }

@@ -9,6 +9,7 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
@@ -70,11 +71,7 @@ pid_t find_by_list(Search& search) {
     return length < 0 ? -1 : found;
 }
 
-}  // namespace
-
-namespace tavo {
-
-pid_t find_running_thread(pthread_t thread) {
+pid_t find(pthread_t thread) {
     uintptr_t own_list = 0;
     if (!read_robust_list(0, own_list) || own_list == 0) return -1;
     const uintptr_t distance = own_list - static_cast<uintptr_t>(pthread_self());
@@ -86,6 +83,17 @@ pid_t find_running_thread(pthread_t thread) {
         search.starting = false;
         found = find_by_list(search);
     }
+    return found;
+}
+
+}  // namespace
+
+namespace tavo {
+
+pid_t find_running_thread(pthread_t thread) {
+    const int error = errno;  // Callers print that of the call they ask about.
+    const pid_t found = find(thread);
+    errno = error;
     return found;
 }
 

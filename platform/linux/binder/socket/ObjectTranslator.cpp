@@ -215,9 +215,9 @@ bool ObjectTranslator::unpackObject(flat_binder_object& object, Frame& frame, co
 }
 
 bool ObjectTranslator::takeDescriptor(uint64_t index, Frame& frame, UniqueFd& descriptor) {
-    if (index >= frame.descriptors.size() || !frame.descriptors[index].valid()) return false;
-    descriptor = std::move(frame.descriptors[index]);
-    return true;
+    if (index >= frame.descriptors.size()) return false;
+    descriptor = std::move(frame.descriptors[static_cast<size_t>(index)]);
+    return descriptor.valid();
 }
 
 void ObjectTranslator::releaseReceived(Parcel*, const uint8_t* data, size_t, const binder_size_t*, size_t,

@@ -225,8 +225,9 @@ TEST(MemoryHeapOnAFile, ThatCannotBeMappedIsNoHeap) {
     const int fd = make_file(kPage);
     expect_no_heap(*sp<MemoryHeapBase>(new MemoryHeapBase(fd, kPage, 0, 1)));
     expect_no_heap(*sp<MemoryHeapBase>(new MemoryHeapBase(fd, 0, 0, static_cast<uint32_t>(kPage))));
+    expect_no_heap(*sp<MemoryHeapBase>(new MemoryHeapBase(fd, 0, 0, 0xFFFFF000U)));
     close(fd);
-    EXPECT_EQ(log.lines("MemoryHeapBase").size(), 3U);
+    EXPECT_EQ(log.lines("MemoryHeapBase").size(), 4U);
     EXPECT_EQ(count_descriptors(), descriptors);
 }
 
@@ -257,6 +258,7 @@ TEST(MemoryHeapStub, RefusesOtherInterfacesAndCodes) {
 }
 
 TEST(MemoryHeapStub, RefusesASizeThatTheReplyCannotHold) {
+    if (SIZE_MAX <= UINT32_MAX) GTEST_SKIP() << "there are no such sizes here";
     class Huge : public BnMemoryHeap {
         int getHeapID() const override { return -1; }
         void* getBase() const override { return MAP_FAILED; }

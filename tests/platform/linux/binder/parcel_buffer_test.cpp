@@ -192,7 +192,7 @@ TEST(ParcelSpeed, ASmallRequestTakesOneAllocationAndAReadNone) {
             return realloc(block, size);
         });
     const PlatformHook objects(
-        "libbinder.so", "_Znwm", +[](size_t size) -> void* {
+        "libbinder.so", tavo::test::kOperatorNew, +[](size_t size) -> void* {
             ++g_allocations;
             return ::operator new(size);
         });

@@ -293,7 +293,7 @@ TEST(RemoteHeap, ThatCannotBeAllocatedIsThrownAndTheNextOneIsMade) {
     int failures = 0;
     for (int allocations = 0; client == nullptr && allocations < 20; ++allocations) {
         g_allocations_left = allocations;
-        const PlatformHook hook("libbinder.so", "_Znwm", allocate_or_throw);
+        const PlatformHook hook("libbinder.so", tavo::test::kOperatorNew, allocate_or_throw);
         try {
             client = interface_cast<IMemoryHeap>(proxy);
         } catch (const std::bad_alloc&) {
