@@ -3,6 +3,7 @@
 
 #include <binder/Binder.h>
 #include <binder/Parcel.h>
+#include <fcntl.h>
 #include <linux/android/binder.h>
 
 #include <cstring>
@@ -30,6 +31,12 @@ inline std::vector<ObjectPlan> take_objects(Script& script) {
     return plans;
 }
 
+// Where what is written to a received descriptor goes.
+inline uint32_t some_descriptor() {
+    static const int descriptor = open("/dev/null", O_RDWR | O_CLOEXEC);
+    return static_cast<uint32_t>(descriptor);
+}
+
 inline flat_binder_object make_object(const ObjectPlan& plan, const android::sp<android::BBinder>& local) {
     constexpr uint32_t kTypes[] = {BINDER_TYPE_BINDER, BINDER_TYPE_HANDLE, BINDER_TYPE_FD, BINDER_TYPE_WEAK_BINDER, 0};
     flat_binder_object object = {};
@@ -39,7 +46,7 @@ inline flat_binder_object make_object(const ObjectPlan& plan, const android::sp<
         object.binder = reinterpret_cast<uintptr_t>(local->getWeakRefs());
         object.cookie = reinterpret_cast<uintptr_t>(local.get());
     } else if (object.hdr.type == BINDER_TYPE_FD) {
-        object.handle = plan.number % 4 == 0 ? UINT32_MAX : plan.number % 4;
+        object.handle = plan.number % 4 == 0 ? UINT32_MAX : some_descriptor();
     }
     return object;
 }

@@ -65,6 +65,15 @@ Tables read_tables(const dl_phdr_info& info) {
     return tables;
 }
 
+bool is_meant(const char* name, const char* function) {
+    if (strcmp(name, function) == 0) return true;
+    constexpr const char* kCheckedCalls[][2] = {{"poll", "__poll_chk"}, {"read", "__read_chk"}};
+    for (const auto& [plain, checked] : kCheckedCalls) {
+        if (strcmp(function, plain) == 0 && strcmp(name, checked) == 0) return true;
+    }
+    return false;
+}
+
 template <typename Relocation>
 void scan(const Tables& tables, uintptr_t start, size_t size, Search& search) {
     const auto* relocation = reinterpret_cast<const Relocation*>(start);
@@ -72,7 +81,7 @@ void scan(const Tables& tables, uintptr_t start, size_t size, Search& search) {
     for (; relocation < end; ++relocation) {
         const size_t index = symbol_of(relocation->r_info);
         if (index == 0) continue;
-        if (strcmp(tables.strings + tables.symbols[index].st_name, search.function) == 0) {
+        if (is_meant(tables.strings + tables.symbols[index].st_name, search.function)) {
             search.found.push_back(reinterpret_cast<void**>(tables.base + relocation->r_offset));
         }
     }
@@ -121,6 +130,12 @@ PlatformHook::PlatformHook(const ObjectFilter& objects, const char* function, vo
         slots_.push_back({slot, *slot});
         write_slot(slot, replacement);
     }
+}
+
+bool PlatformHook::imports(const char* object, const char* function) {
+    Search search{object_named(object), function, {}};
+    dl_iterate_phdr(visit, &search);
+    return !search.found.empty();
 }
 
 PlatformHook::~PlatformHook() {

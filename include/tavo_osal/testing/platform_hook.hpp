@@ -25,7 +25,9 @@ using ObjectFilter = std::function<bool(const std::string& object)>;
  *     PlatformHook hook("libtavoosal.so", "pipe2", +[](int*, int) { errno = EMFILE; return -1; });
  *
  * Replacements are plain functions; what they need is kept in statics. Hooks of one function end in the opposite
- * order of their making. They are not made or ended while other threads make the first of the redirected calls.
+ * order of their making. With poll and read, their checked variants, which optimised builds call, are redirected as
+ * well: the one argument more that these have comes last. Hooks are not made or ended while other threads make the
+ * first of the redirected calls.
  */
 class PlatformHook {
 public:
@@ -49,6 +51,11 @@ public:
     PlatformHook(const ObjectFilter& objects, const char* function, void* replacement);
     /** Lets the calls go where they went before. */
     ~PlatformHook();
+    /**
+     * Whether the object imports the function by this very name. Optimised builds call checked variants of some, with
+     * other arguments: a replacement for __snprintf_chk is not one for snprintf.
+     */
+    static bool imports(const char* object, const char* function);
     PlatformHook(const PlatformHook&) = delete;
     PlatformHook& operator=(const PlatformHook&) = delete;
 
