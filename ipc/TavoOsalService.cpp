@@ -1,6 +1,10 @@
 // The queues, and the service's life. Its blocks are in TavoOsalServiceBlocks.cpp.
 #include "ipc/TavoOsalService.h"
 
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
@@ -97,6 +101,9 @@ int TavoOsalService::TavoOsalServiceDeInit() {
     KeyRecord** queues = std::exchange(m_ppQueues, nullptr);
     const uint32_t queue_count = std::exchange(m_uiQueueCount, 0U);
     m_uiQueueRoom = 0;
+    m_queuesByKey = {};
+    m_queueOrders = {};
+    m_blocksByKey = {};
     lock.unlock();
 
     if (blocks != nullptr && blocks->pHead != nullptr) freeBlocks(blocks);
@@ -122,10 +129,10 @@ int TavoOsalService::create_message_queue(int key) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "NO LIST\n");
         return -1;
     }
-    const int index = findQueue(key);
-    if (index < 0) return addQueue(key);
-    ++m_ppQueues[index]->uiUseCount;
-    return index;
+    const Queue* queue = findQueue(key);
+    if (queue == nullptr) return addQueue(key);
+    ++queue->pRecord->uiUseCount;
+    return static_cast<int>(placeOf(*queue));
 }
 
 // A queue that cannot be made, for want of descriptors or memory, leaves the table as it was.
@@ -143,8 +150,16 @@ int TavoOsalService::addQueue(int key) {
         queue->disown_descriptors();
         return -1;
     }
+    // Not with the last descriptor: those who want to give a queue back must be let in first.
+    const int spare = fcntl(queue->iReadFd, F_DUPFD_CLOEXEC, 0);
+    if (spare < 0) return -1;
+    close(spare);
     auto* record = static_cast<KeyRecord*>(calloc(1, sizeof(KeyRecord)));
     if (record == nullptr) return -1;
+    if (!indexQueue(key, record)) {
+        free(record);
+        return -1;
+    }
     record->iKey = key;
     record->uiUseCount = 1;
     record->pvObject = queue.release();
@@ -159,13 +174,16 @@ int TavoOsalService::delete_message_queue(int key) {
     }
     std::unique_ptr<TAVO_MessageQueue> deleted;  // declared first: closes its pipe without the lock
     const std::lock_guard<std::mutex> lock(tavo::service_lock());
-    const int index = findQueue(key);
-    if (index < 0) return -1;
-    KeyRecord* record = m_ppQueues[index];
+    const Queue* queue = findQueue(key);
+    if (queue == nullptr) return -1;
+    KeyRecord* record = queue->pRecord;
     if (--record->uiUseCount > 0) return 0;
     deleted.reset(static_cast<TAVO_MessageQueue*>(record->pvObject));
-    for (uint32_t i = static_cast<uint32_t>(index); i + 1 < m_uiQueueCount; ++i) m_ppQueues[i] = m_ppQueues[i + 1];
+    const uint32_t place = placeOf(*queue);
+    std::copy(m_ppQueues + place + 1, m_ppQueues + m_uiQueueCount, m_ppQueues + place);
     m_ppQueues[--m_uiQueueCount] = nullptr;
+    m_queueOrders.erase(m_queueOrders.begin() + place);
+    m_queuesByKey.erase(key);
     free(record);
     return 0;
 }
@@ -189,16 +207,31 @@ int TavoOsalService::get_write_fd(int key) {
 }
 
 TAVO_MessageQueue* TavoOsalService::queueOf(int key) const {
-    const int index = findQueue(key);
-    return index >= 0 ? static_cast<TAVO_MessageQueue*>(m_ppQueues[index]->pvObject) : nullptr;
+    const Queue* queue = findQueue(key);
+    return queue != nullptr ? static_cast<TAVO_MessageQueue*>(queue->pRecord->pvObject) : nullptr;
 }
 
-// The key's place in the table, or -1.
-int TavoOsalService::findQueue(int key) const {
-    for (uint32_t i = 0; m_ppQueues != nullptr && i < m_uiQueueCount; ++i) {
-        if (m_ppQueues[i]->iKey == key) return static_cast<int>(i);
+const TavoOsalService::Queue* TavoOsalService::findQueue(int key) const {
+    const auto found = m_queuesByKey.find(key);
+    return found != m_queuesByKey.end() ? &found->second : nullptr;
+}
+
+// Enters a queue that is about to become the table's last. False, and nothing has changed, when there is no memory.
+bool TavoOsalService::indexQueue(int key, KeyRecord* pRecord) {
+    try {
+        if (m_queueOrders.size() == m_queueOrders.capacity()) m_queueOrders.reserve(m_queueOrders.size() * 2 + 1);
+        m_queuesByKey.emplace(key, Queue{pRecord, m_uiLastOrder + 1});
+    } catch (const std::bad_alloc&) {
+        return false;
     }
-    return -1;
+    m_queueOrders.push_back(++m_uiLastOrder);
+    return true;
+}
+
+// The queue's place in the packed table, which moves when an earlier one goes.
+uint32_t TavoOsalService::placeOf(const Queue& queue) const {
+    const auto place = std::lower_bound(m_queueOrders.begin(), m_queueOrders.end(), queue.uiOrder);
+    return static_cast<uint32_t>(place - m_queueOrders.begin());
 }
 
 }  // namespace android

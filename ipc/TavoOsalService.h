@@ -4,6 +4,8 @@
 #include <binder/IMemory.h>
 
 #include <cstdint>
+#include <unordered_map>
+#include <vector>
 
 #include "ipc/ITavoBinder.h"
 #include "tavo_osal/export.h"
@@ -73,6 +75,10 @@ private:
         void* pvObject;        // a queue's TAVO_MessageQueue, a block's sp<IMemoryHeap>, both owned
         TAVO_ListNode stLink;  // of a block
     };
+    struct Queue {
+        KeyRecord* pRecord;
+        uint64_t uiOrder;  // goes up with every queue that is made
+    };
     struct BlockList {
         TAVO_ListNode* pHead;  // null while there is no list
         uint32_t uiCount;
@@ -81,9 +87,13 @@ private:
 
     TAVO_LOCAL int initBlockList(unsigned int uiMaximum);
     TAVO_LOCAL TAVO_MessageQueue* queueOf(int key) const;
-    TAVO_LOCAL int findQueue(int key) const;
+    TAVO_LOCAL const Queue* findQueue(int key) const;
+    TAVO_LOCAL bool indexQueue(int key, KeyRecord* pRecord);
+    TAVO_LOCAL uint32_t placeOf(const Queue& queue) const;
     TAVO_LOCAL int addQueue(int key);
     TAVO_LOCAL KeyRecord* findBlock(int key, uint32_t uiMatchLevel) const;
+    TAVO_LOCAL void logWayTo(const KeyRecord* pRecord) const;
+    TAVO_LOCAL bool indexBlock(int key, KeyRecord* pRecord);
     TAVO_LOCAL sp<IMemoryHeap> addBlock(int key, int size);
     TAVO_LOCAL bool hasBlockList() const;
     TAVO_LOCAL static void freeBlocks(BlockList* pBlocks);
@@ -97,6 +107,12 @@ private:
     uint32_t m_uiQueueCount = 0;
     BlockList* m_pBlocks = nullptr;
     uint32_t m_uiQueueRoom = 0;
+    uint64_t m_uiLastOrder = 0;
+    // The records of both tables by key, and the orders of the queue table's entries, which make a place in it
+    // findable: no operation walks a table.
+    std::unordered_map<int32_t, Queue> m_queuesByKey;
+    std::vector<uint64_t> m_queueOrders;
+    std::unordered_map<int32_t, KeyRecord*> m_blocksByKey;
 };
 
 }  // namespace android

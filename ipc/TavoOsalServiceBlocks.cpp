@@ -7,10 +7,10 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <new>
-#include <vector>
 
 #include "ipc/TavoOsalService.h"
 #include "ipc/service_lock.h"
@@ -33,29 +33,24 @@ namespace {
 constexpr char kTag[] = "MSGQUEUE_BINDER";
 constexpr char kCountTag[] = "OSAL_SHM";
 constexpr char kComparing[] = "Comparing input memory index with values available in memory list nodes.\n";
-constexpr size_t kUsualHeaps = 25;
 
-// Every live block of the process, in the order of creation: keeps it whatever becomes of the service object.
-// Released when the process exits.
+// Every live block of the process: keeps it whatever becomes of the service object. Released when the process exits.
 class HeapTable {
 public:
-    HeapTable() { heaps_.reserve(kUsualHeaps); }
-
-    void add(const sp<IMemoryHeap>& heap) { heaps_.push_back(heap); }
-    // Hands out the first heap at this address; null when there is none.
+    void add(const sp<IMemoryHeap>& heap) { heaps_.emplace(heap->getBase(), heap); }
+    // Hands out the first heap that was added at this address; null when there is none.
     sp<IMemoryHeap> remove(const void* base) {
-        for (auto heap = heaps_.begin(); heap != heaps_.end(); ++heap) {
-            if ((*heap)->getBase() != base) continue;
-            sp<IMemoryHeap> removed = *heap;
-            heaps_.erase(heap);
-            return removed;
-        }
-        return nullptr;
+        const auto heap = heaps_.lower_bound(base);
+        if (heap == heaps_.end() || heap->first != base) return nullptr;
+        sp<IMemoryHeap> removed = heap->second;
+        heaps_.erase(heap);
+        return removed;
     }
     size_t count() const { return heaps_.size(); }
 
 private:
-    std::vector<sp<IMemoryHeap>> heaps_;
+    // Heaps that could not be mapped have one address in common. They stay in the order of their coming.
+    std::multimap<const void*, sp<IMemoryHeap>> heaps_;
 };
 
 HeapTable g_heaps;
@@ -124,14 +119,21 @@ sp<IMemoryHeap>* TavoOsalService::holderOf(KeyRecord* pRecord) {
 
 TavoOsalService::KeyRecord* TavoOsalService::findBlock(int key, uint32_t uiMatchLevel) const {
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, kComparing);
-    for (TAVO_ListNode* link = m_pBlocks->pHead->next; link != m_pBlocks->pHead; link = link->next) {
-        KeyRecord* record = recordOf(link);
-        TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Trying with node %p.\n", static_cast<void*>(record));
-        if (record->iKey != key) continue;
-        TAVO_LOG(kTag, uiMatchLevel, "Match found at node %p.\n", static_cast<void*>(record));
-        return record;
+    const auto found = m_blocksByKey.find(key);
+    KeyRecord* match = found != m_blocksByKey.end() ? found->second : nullptr;
+    // The log tells of every record on the way, so there is a way only while somebody reads it.
+    if (tavo::log_enabled(TAVO_LOG_DEBUG)) logWayTo(match);
+    if (match != nullptr) {
+        TAVO_LOG(kTag, uiMatchLevel, "Match found at node %p.\n", static_cast<void*>(match));
     }
-    return nullptr;
+    return match;
+}
+
+void TavoOsalService::logWayTo(const KeyRecord* pRecord) const {
+    for (TAVO_ListNode* link = m_pBlocks->pHead->next; link != m_pBlocks->pHead; link = link->next) {
+        TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Trying with node %p.\n", static_cast<void*>(recordOf(link)));
+        if (recordOf(link) == pRecord) return;
+    }
 }
 
 sp<IMemoryHeap> TavoOsalService::get_shared_mem(int key, int size) {
@@ -156,6 +158,16 @@ sp<IMemoryHeap> TavoOsalService::get_shared_mem(int key, int size) {
     return addBlock(key, size);
 }
 
+// False when there is no memory for it.
+bool TavoOsalService::indexBlock(int key, KeyRecord* pRecord) {
+    try {
+        m_blocksByKey[key] = pRecord;
+        return true;
+    } catch (const std::bad_alloc&) {
+        return false;
+    }
+}
+
 sp<IMemoryHeap> TavoOsalService::addBlock(int key, int size) {
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Current num of shared memory blocks = %d\n", static_cast<int>(m_pBlocks->uiCount));
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Max num of shared memory blocks = %d\n", static_cast<int>(m_pBlocks->uiMaximum));
@@ -166,8 +178,9 @@ sp<IMemoryHeap> TavoOsalService::addBlock(int key, int size) {
     char name[64];
     snprintf(name, sizeof name, "SharedMemory_%d\n", key);  // the newline is part of the name, and kept
     auto* record = static_cast<KeyRecord*>(calloc(1, sizeof(KeyRecord)));
-    auto holder = record != nullptr ? make_heap(size, name) : nullptr;
+    auto holder = record != nullptr && indexBlock(key, record) ? make_heap(size, name) : nullptr;
     if (holder == nullptr) {
+        m_blocksByKey.erase(key);
         free(record);
         return nullptr;
     }
@@ -214,6 +227,7 @@ int TavoOsalService::delete_shared_mem(int key) {
     last = forget_heap(heap->getBase());
 
     tavo_osal_list_delete(&record->stLink);
+    m_blocksByKey.erase(key);
     free(record);
     --m_pBlocks->uiCount;
     return 0;

@@ -112,6 +112,43 @@ std::string hammer(const std::string& key) {
     return text;
 }
 
+// Calls for each of so many keys until a status is not 0, which is returned.
+template <typename Call>
+std::string each(int from, int count, Call call) {
+    for (int key = from; key < from + count; ++key) {
+        const std::string status = call(std::to_string(key));
+        if (status != kDone) return status;
+    }
+    return kDone;
+}
+
+// A queue with a message, and a block, whose contents say which key they are of.
+std::string hold(const std::string& key) {
+    std::string status = attach(key);
+    if (status == kDone) status = put(key, std::stoul(key));
+    if (status == kDone) status = acquire(key, 4096);
+    if (status == kDone) *static_cast<int*>(state().blocks.at(key)) = std::stoi(key);
+    return status;
+}
+
+std::string drop_held(const std::string& key) {
+    std::string status = text_of(tavo_msg_queue_destroy(state().queues.at(key)));
+    if (status == kDone) status = release(key);
+    return status == kDone ? remove(key, 4096) : status;
+}
+
+std::string check_held(const std::string& key) {
+    std::string status = attach(key);
+    if (status == kDone && get(key) != key + " whole") status = "another queue's message";
+    if (status == kDone) status = put(key, std::stoul(key));
+    if (status == kDone) status = acquire(key, 1);
+    if (status == kDone && *static_cast<int*>(state().blocks.at(key)) != std::stoi(key)) status = "another block";
+    return status == kDone ? drop_held(key) : status;
+}
+
+constexpr int kAll = 1000000;
+constexpr char kAllGiven[] = "all";
+
 std::string limit(rlim_t count) {
     rlimit now = {};
     getrlimit(RLIMIT_NOFILE, &now);
@@ -151,6 +188,20 @@ std::string obey(const std::string& line) {
         return text_of(tavo_semaphore_init(static_cast<uint32_t>(std::stoul(key)), &state().semaphore));
     }
     if (command == "hammer") return hammer(key);
+    const int first = static_cast<int>(strtol(key.c_str(), nullptr, 10));
+    if (command == "hold") return each(first, static_cast<int>(number), hold);
+    if (command == "check") return each(first, static_cast<int>(number), check_held);
+    if (command == "drop") return each(first, static_cast<int>(number), drop_held);
+    if (command == "flood") return each(first, kAll, attach);
+    if (command == "ebb") {
+        return each(first, kAll, [](const std::string& held) {
+            const auto queue = state().queues.find(held);
+            if (queue == state().queues.end()) return std::string(kAllGiven);
+            return text_of(tavo_msg_queue_destroy(queue->second));
+        });
+    }
+    if (command == "soak")
+        return each(first, TAVO_SHM_MAX_ACQUIRED, [](const std::string& block) { return acquire(block, 100); });
     if (command == "limit") return limit(std::stoul(key));
     return "no such command: " + line;
 }
