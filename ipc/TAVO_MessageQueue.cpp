@@ -20,6 +20,7 @@ using android::TAVO_MessageQueue;
 
 constexpr char kTag[] = "MSGQUEUE";
 constexpr size_t kMaxMessage = TAVO_MessageQueue::MAX_MESSAGE_SIZE;
+constexpr uint32_t kSmallestPage = 4096;
 constexpr int32_t kNoDevice = -19;
 constexpr int32_t kInvalidArgument = -22;
 
@@ -52,9 +53,9 @@ int32_t receive(TAVO_MessageQueue& queue, unsigned char* buffer, size_t room, un
     uint32_t length = 0;
     memcpy(&length, whole ? prefix : buffer, sizeof length);
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Reading message with lenghth %d \n", static_cast<int>(length));
-    // What is written in one piece is there with its length. A longer message's sender may have been killed behind
-    // it, and nobody would ever end a read of what has not come.
-    const bool may_be_torn = length > PIPE_BUF - sizeof prefix;
+    // A pipe takes first what is over whole pages. So the length may be all that came of a message of whole pages
+    // whose sender was killed, and nobody would ever end a read of the rest.
+    const bool may_be_torn = length != 0 && length % kSmallestPage == 0;
     if (whole && (!may_be_torn || tavo::comes(queue.iReadFd))) {
         count = tavo::read_all(queue.iReadFd, buffer, room, std::min<size_t>(length, kMaxMessage), true);
     } else if (count > 0) {

@@ -75,7 +75,7 @@ TEST_P(SenderCrash, InsideAFrameThatIsWaitedForGivesWhatCame) {
     Peer sender("attach 7");
     receiver.tell("get 7");
     ASSERT_TRUE(waits_in(receiver.pid(), SYS_read));
-    sender.crash("libtavoosal.so write " + std::to_string(GetParam().bytes) + " 1", "put 7 5000");
+    sender.crash("libtavoosal.so write " + std::to_string(GetParam().bytes) + " 1", "put 7 8192");
     EXPECT_EQ(receiver.answer(), GetParam().result);
     Peer next("attach 7");
     EXPECT_EQ(next.ask("put 7 1000"), kDone);
