@@ -1,11 +1,9 @@
 // Reads received parcels of any contents, with objects at any offsets, in any order of operations.
 //
 // The input is a script: a count of objects; for each its offset, its type and its number; a count of
-// operations and their codes; the rest are the parcel's bytes. Objects are put in as a driver would, so that only
-// binders of this process come with an address, and what a driver could never hand over is taken off the list.
+// operations and their codes; the rest are the parcel's bytes.
 #include <binder/Binder.h>
 #include <binder/Parcel.h>
-#include <linux/android/binder.h>
 
 #include <cstddef>
 #include <cstdint>
@@ -13,90 +11,14 @@
 #include <cstring>
 #include <vector>
 
+#include "fuzz/received_parcel.h"
+#include "fuzz/script.h"
+
 namespace {
 
 using namespace android;
-
-class Script {
-public:
-    Script(const uint8_t* data, size_t size) : next_(data), end_(data + size) {}
-
-    template <typename T>
-    T take() {
-        T value{};
-        const size_t left = static_cast<size_t>(end_ - next_);
-        const size_t size = left < sizeof value ? left : sizeof value;
-        if (size != 0) memcpy(&value, next_, size);
-        next_ += size;
-        return value;
-    }
-
-    std::vector<uint8_t> rest() {
-        std::vector<uint8_t> bytes(next_, end_);
-        next_ = end_;
-        return bytes;
-    }
-
-private:
-    const uint8_t* next_;
-    const uint8_t* end_;
-};
-
-struct ObjectPlan {
-    binder_size_t offset;
-    uint8_t type;
-    uint32_t number;
-};
-
-// A received parcel's memory, which the parcel gives back.
-struct Buffer {
-    std::vector<uint8_t> bytes;
-    std::vector<binder_size_t> offsets;
-};
-
-bool fits(const Buffer& buffer, binder_size_t offset) {
-    return offset <= buffer.bytes.size() && buffer.bytes.size() - offset >= sizeof(flat_binder_object);
-}
-
-flat_binder_object make_object(const ObjectPlan& plan, const sp<BBinder>& local) {
-    constexpr uint32_t kTypes[] = {BINDER_TYPE_BINDER, BINDER_TYPE_HANDLE, BINDER_TYPE_FD, BINDER_TYPE_WEAK_BINDER, 0};
-    flat_binder_object object = {};
-    object.hdr.type = kTypes[plan.type % (sizeof kTypes / sizeof kTypes[0])];
-    object.handle = plan.number;
-    if (object.hdr.type == BINDER_TYPE_BINDER) {
-        object.binder = reinterpret_cast<uintptr_t>(local->getWeakRefs());
-        object.cookie = reinterpret_cast<uintptr_t>(local.get());
-    } else if (object.hdr.type == BINDER_TYPE_FD) {
-        object.handle = plan.number % 4 == 0 ? UINT32_MAX : plan.number % 4;
-    }
-    return object;
-}
-
-void receive(Parcel& parcel, std::vector<uint8_t> bytes, const std::vector<ObjectPlan>& plans,
-             const sp<BBinder>& local) {
-    auto* buffer = new Buffer{std::move(bytes), {}};
-    for (const ObjectPlan& plan : plans) {
-        if (!fits(*buffer, plan.offset)) continue;
-        const flat_binder_object object = make_object(plan, local);
-        memcpy(buffer->bytes.data() + plan.offset, &object, sizeof object);
-    }
-    for (const ObjectPlan& plan : plans) {
-        if (fits(*buffer, plan.offset)) {
-            // An object that overlaps another one may have come to claim an address that no driver would.
-            flat_binder_object object;
-            memcpy(&object, buffer->bytes.data() + plan.offset, sizeof object);
-            const auto address = reinterpret_cast<uintptr_t>(local.get());
-            if (object.hdr.type == BINDER_TYPE_BINDER && object.cookie != address) continue;
-        }
-        buffer->offsets.push_back(plan.offset);
-    }
-    parcel.ipcSetDataReference(
-        buffer->bytes.data(), buffer->bytes.size(), buffer->offsets.data(), buffer->offsets.size(),
-        [](Parcel*, const uint8_t*, size_t, const binder_size_t*, size_t, void* cookie) {
-            delete static_cast<Buffer*>(cookie);
-        },
-        buffer);
-}
+using tavo::fuzz::ObjectPlan;
+using tavo::fuzz::Script;
 
 // Touches every byte of a block, so that a sanitizer sees where it ends.
 void use(const void* block, size_t size) {
@@ -168,13 +90,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     static const sp<BBinder>& local = *new sp<BBinder>(new BBinder);
 
     Script script(data, size);
-    std::vector<ObjectPlan> plans;
-    for (int count = script.take<uint8_t>() % 8; count > 0; --count) {
-        const auto offset = script.take<uint16_t>();
-        // Mostly near the beginning, where the bytes are, but sometimes anywhere at all.
-        const binder_size_t anywhere = offset % 16 == 15 ? ~binder_size_t{0} - offset / 16 : offset % 256;
-        plans.push_back({anywhere, script.take<uint8_t>(), script.take<uint32_t>()});
-    }
+    const std::vector<ObjectPlan> plans = tavo::fuzz::take_objects(script);
     struct Operation {
         uint8_t code;
         uint32_t value;
@@ -184,7 +100,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
         operations.push_back({script.take<uint8_t>(), script.take<uint32_t>()});
     }
     Parcel parcel;
-    receive(parcel, script.rest(), plans, local);
+    tavo::fuzz::receive(parcel, script.rest(), plans, local);
     for (const Operation& operation : operations) {
         operate(parcel, operation.code, operation.value, local);
         if (parcel.dataAvail() > parcel.dataSize()) abort();

@@ -52,7 +52,12 @@ int32_t receive(TAVO_MessageQueue& queue, unsigned char* buffer, size_t room, un
     uint32_t length = 0;
     memcpy(&length, whole ? prefix : buffer, sizeof length);
     TAVO_LOG(kTag, TAVO_LOG_DEBUG, "Reading message with lenghth %d \n", static_cast<int>(length));
-    if (whole) {
+    // What is written in one piece is there with its length. A longer message's sender may have been killed behind
+    // it, and nobody would ever end a read of what has not come.
+    const bool may_be_torn = length > PIPE_BUF - sizeof prefix;
+    if (whole && may_be_torn && !tavo::comes(queue.iReadFd)) {
+        count = 0;
+    } else if (whole) {
         count = tavo::read_all(queue.iReadFd, buffer, room, std::min<size_t>(length, kMaxMessage), true);
     } else if (count > 0) {
         count = 0;  // no message follows a length that did not come whole

@@ -10,6 +10,10 @@
 #include "tavo_osal/list.h"
 #include "tavo_osal/status.h"
 
+namespace tavo {
+struct ServiceFigures;
+}  // namespace tavo
+
 namespace android {
 
 class TAVO_MessageQueue;
@@ -49,6 +53,17 @@ public:
     sp<IMemoryHeap> get_shared_mem(int key, int size) override;
     int delete_shared_mem(int key) override;
 
+    /**
+     * Writes the figures of both tables, as the platform's dump call asks for them: a text for people, or, with an
+     * argument "--json", one line of JSON. Holds up neither the other operations nor, for more than two seconds, its
+     * own thread when nobody reads.
+     * @param fd   where to write; stays the caller's
+     * @param args "--json", or "-h" for help; others are ignored
+     * @return 0; TIMED_OUT: nobody read; WOULD_BLOCK: too many others are being written; NO_MEMORY; or the negative
+     *         errno of a failed write
+     */
+    status_t dump(int fd, const Vector<String16>& args) override;
+
 private:
     // One layout for both tables.
     struct KeyRecord {
@@ -74,6 +89,9 @@ private:
     TAVO_LOCAL static void freeBlocks(BlockList* pBlocks);
     TAVO_LOCAL static KeyRecord* recordOf(TAVO_ListNode* pLink);
     TAVO_LOCAL static sp<IMemoryHeap>* holderOf(KeyRecord* pRecord);
+    TAVO_LOCAL tavo::ServiceFigures collectFigures() const;
+    TAVO_LOCAL tavo::ServiceFigures snapshot() const;
+    TAVO_LOCAL int duplicateReadEnd(int key) const;
 
     KeyRecord** m_ppQueues = nullptr;  // null while there is no table; its used entries have no holes
     uint32_t m_uiQueueCount = 0;

@@ -56,6 +56,8 @@ void make_room(int fd, int frame_size) {
     while (wanted > current && fcntl(fd, F_SETPIPE_SZ, wanted) < 0) wanted /= 2;
 }
 
+bool comes(int fd) { return becomes_ready(fd, POLLIN); }
+
 bool write_rest(int fd, const unsigned char* data, size_t length, ssize_t count) {
     size_t done = 0;
     for (;;) {

@@ -24,6 +24,9 @@ inline bool write_all(int fd, const unsigned char* data, size_t length) {
     return __builtin_expect(count == static_cast<ssize_t>(length), 1) || write_rest(fd, data, length, count);
 }
 
+// Waits up to a second until something can be read, or the other side has gone.
+bool comes(int fd);
+
 // Reads length bytes, with one read when they are all there and the buffer holds them; a buffer that does not is
 // filled from its start again and again. Waits for bytes that are late, up to a second each time. Fewer than length
 // when the time or the file has ended; -1 and errno when the read failed before the first byte. begun says that the

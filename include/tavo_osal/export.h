@@ -6,7 +6,9 @@
 #define TAVO_OSAL_EXPORT_H
 
 #ifdef __cplusplus
+/** Begins the declarations of a header, with C linkage. */
 #define TAVO_BEGIN_DECLS extern "C" {
+/** Ends them. */
 #define TAVO_END_DECLS }
 #else
 #define TAVO_BEGIN_DECLS

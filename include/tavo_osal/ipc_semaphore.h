@@ -14,6 +14,9 @@
  * No locks are taken beyond that, and nothing is kept. Every function may be called from any thread. A thread that is
  * cancelled ends at once while it waits in tavo_semaphore_acquire(), and after a tavo_semaphore_init() that it is in.
  * Processes that share a semaphore must be of the same word size.
+ *
+ * Not to be confused with the tavo_osal_semaphore_* functions of tavo_osal/semaphore.h: those are counting semaphores
+ * in the caller's storage.
  */
 #ifndef TAVO_OSAL_IPC_SEMAPHORE_H
 #define TAVO_OSAL_IPC_SEMAPHORE_H

@@ -31,7 +31,11 @@ enum {
 
 /** Output streams a preference can select. The selection is recorded only: every message goes to
  *  the Android log. */
-enum { TAVO_LOG_STREAM_CONSOLE = 1, TAVO_LOG_STREAM_FILE = 2, TAVO_LOG_STREAM_CALLBACK = 3 };
+enum {
+    TAVO_LOG_STREAM_CONSOLE = 1, /**< "-s" */
+    TAVO_LOG_STREAM_FILE = 2,    /**< "-f" */
+    TAVO_LOG_STREAM_CALLBACK = 3 /**< "-c" */
+};
 
 /** A user's log callback. Recorded by the preference "-c"; this version never calls it. */
 typedef void (*TAVO_LogCallback)(void* pvParam);

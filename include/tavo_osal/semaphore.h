@@ -5,6 +5,9 @@
  * The semaphores follow the platform's rules; one created with the shared flag in shared memory works across
  * processes. create, wait, timedwait and post do not check their address, the others do. Messages carry the tag
  * "TAVO_OSAL" and level 1; the last three functions also trace their entry and every exit at level 6.
+ *
+ * Not to be confused with the tavo_semaphore_* functions of tavo_osal/ipc_semaphore.h: those are binary semaphores that
+ * processes share by a key.
  */
 #ifndef TAVO_OSAL_SEMAPHORE_H
 #define TAVO_OSAL_SEMAPHORE_H

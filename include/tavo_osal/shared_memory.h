@@ -52,7 +52,8 @@ TAVO_API TAVO_Status tavo_osal_shared_memory_key_create(uint32_t* puiKey);
  * Makes a handle. The service is not asked.
  *
  * @param uiKey    the block's key
- * @param ppHandle receives the handle, which tavo_shm_delete() frees; null when there is no memory
+ * @param ppHandle receives the handle, which tavo_shm_delete() frees; null when there is no memory. One that could not
+ *                 be acquired is freed with tavo_osal_mem_free(): deleting would take back somebody else's use
  * @param uiSize   bytes, not 0. Only counts when the block is made: a block that exists is acquired as it is
  * @return #TAVO_SUCCESS; #TAVO_INVALID_PARAM: ppHandle is null or uiSize is 0; #TAVO_NO_MEMORY
  */

@@ -14,6 +14,8 @@
  * logged and the answer is #TAVO_INVALID_PARAM, or -1 from the functions that answer with a byte count.
  * Buffers, poll arrays and accept's address are not checked: the platform refuses bad ones with EFAULT.
  *
+ * The public names spell "recieve" so, and stay so: programs are linked to them.
+ *
  * Every function may be called from any thread, with the one exception documented at
  * tavo_osal_socket_connect() and tavo_osal_socket_bind(). Ports are in host byte order, and only their low
  * 16 bits count.

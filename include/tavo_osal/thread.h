@@ -48,7 +48,10 @@ typedef void* (*TAVO_ThreadStart)(void* pvArg);
 typedef void (*TAVO_SignalHandler)(int iSignal);
 
 /** Policies of tavo_osal_thread_set_real_time_priority(). */
-enum { TAVO_THREAD_POLICY_RR = 1, TAVO_THREAD_POLICY_FIFO = 2 };
+enum {
+    TAVO_THREAD_POLICY_RR = 1,  /**< SCHED_RR: threads of one priority take turns */
+    TAVO_THREAD_POLICY_FIFO = 2 /**< SCHED_FIFO: a thread runs until it waits */
+};
 
 /**
  * Starts a thread, joinable and with the platform's default stack, and installs the handler of the cancellation

@@ -37,10 +37,13 @@ typedef struct TAVO_Timer TAVO_Timer;
 typedef void* (*TAVO_TimerCallback)(void* pvArg);
 
 /** Kinds of timers. */
-enum { TAVO_TIMER_ONE_SHOT = 0, TAVO_TIMER_PERIODIC = 1 };
+enum {
+    TAVO_TIMER_ONE_SHOT = 0, /**< fires once */
+    TAVO_TIMER_PERIODIC = 1  /**< fires again and again */
+};
 
 /** How many timers a framework holds. Creating more is not reported, see tavo_osal_timer_create(). */
-enum { TAVO_TIMERS_PER_FRAMEWORK = 5 };
+enum { TAVO_TIMERS_PER_FRAMEWORK = 5 /**< five */ };
 
 /**
  * Creates a framework and starts its worker thread. Success is logged at level 3.

@@ -57,7 +57,8 @@ TEST_F(Destroy, LogsEveryStep) {
 // Where memory is handed out from the top of a 32-bit address space down, queues lie in its upper half.
 constexpr size_t kBlockSize = 4096;
 int g_high_blocks = 0;
-bool is_high(uintptr_t address) { return address > INT32_MAX; }
+// The allocator's own blocks may lie there as well, but never begin with a page.
+bool is_high(uintptr_t address) { return address > INT32_MAX && address % kBlockSize == 0; }
 void* allocate_high(size_t size, const std::nothrow_t& tag) {
     if (size != sizeof(android::TAVO_MessageQueue)) return operator new(size, tag);
     void* wish = reinterpret_cast<void*>(uintptr_t{0xA0000000});

@@ -338,8 +338,26 @@ int snprintf_without_paths(char* buffer, size_t size, const char* format, ...) {
     return length;
 }
 
+// What optimised builds call in its place.
+int checked_snprintf_without_paths(char* buffer, size_t size, int, size_t, const char* format, ...) {
+    if (strcmp(format, "%s%s%s") == 0) return -1;
+    va_list values;
+    va_start(values, format);
+    const int length = vsnprintf(buffer, size, format, values);
+    va_end(values);
+    return length;
+}
+
+PlatformHook fail_to_format_paths() {
+    constexpr char kChecked[] = "__snprintf_chk";
+    if (PlatformHook::imports("libtavoosal.so", kChecked)) {
+        return PlatformHook("libtavoosal.so", kChecked, checked_snprintf_without_paths);
+    }
+    return PlatformHook("libtavoosal.so", "snprintf", snprintf_without_paths);
+}
+
 TEST_F(LogPreference, ReportsAFilePathThatCouldNotBeFormatted) {
-    const PlatformHook hook("libtavoosal.so", "snprintf", snprintf_without_paths);
+    const PlatformHook hook = fail_to_format_paths();
     const LogCapture log;
     apply("name -t");
     EXPECT_TRUE(logged_exactly(log.lines(), {{1, "TAVO_LOG", "snprintf failed.\n"}}));

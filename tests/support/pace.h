@@ -1,6 +1,8 @@
 // How fast this build's programs run.
 #pragma once
 
+#include <cstdlib>
+
 #include "support/process.h"
 
 namespace tavo::test {
@@ -14,6 +16,6 @@ inline constexpr bool kSanitized = false;
 
 // Whether everything takes many times as long as on the machine itself: tests that repeat something thousands of times
 // repeat it less often then.
-inline bool is_slow() { return kSanitized || emulator() != nullptr; }
+inline bool is_slow() { return kSanitized || emulator() != nullptr || getenv("TAVO_TEST_GUEST") != nullptr; }
 
 }  // namespace tavo::test

@@ -2,9 +2,8 @@
 #pragma once
 
 #include <gtest/gtest.h>
-#include <unistd.h>
 
-#include "support/platform_fault.h"
+#include "tavo_osal/testing/manual_ticks.hpp"
 #include "tavo_osal/timer.h"
 
 namespace tavo::test {
@@ -12,28 +11,38 @@ namespace tavo::test {
 class TickDriver {
 public:
     // Makes a framework, whose worker goes to sleep for its first tick.
-    explicit TickDriver(unsigned tick_ms);
+    explicit TickDriver(unsigned tick_ms) {
+        EXPECT_EQ(tavo_osal_timer_framework_init(tick_ms, &framework_), TAVO_SUCCESS);
+    }
     // Ends the framework unless forget() was called.
-    ~TickDriver();
+    ~TickDriver() {
+        if (framework_ != nullptr) {
+            EXPECT_EQ(uninit(), TAVO_SUCCESS);
+        }
+    }
     TickDriver(const TickDriver&) = delete;
     TickDriver& operator=(const TickDriver&) = delete;
 
     TAVO_TimerFramework* framework() const { return framework_; }
 
     // Lets the worker through one sleep after another and returns when it has gone back to sleep.
-    void tick(int times = 1);
+    void tick(int times = 1) { ticks_.tick(static_cast<unsigned>(times)); }
     // Lets the worker through one sleep and does not wait for it: it is going to end, or to wait for the test.
-    void last_tick();
+    void last_tick() { ticks_.begin_tick(); }
     // Ends the framework: the worker does one more round. The result of tavo_osal_timer_framework_uninit().
-    TAVO_Status uninit();
+    TAVO_Status uninit() {
+        const TAVO_Status status = tavo_osal_timer_framework_uninit(framework_);
+        if (status == TAVO_SUCCESS) forget();
+        return status;
+    }
     // The framework is gone, or is the test's affair from now on.
     void forget() { framework_ = nullptr; }
 
-    // What the worker last asked to sleep for.
-    static useconds_t asked_for();
+    // What the worker last asked to sleep for, in microseconds.
+    uint32_t asked_for() const { return ticks_.last_sleep(); }
 
 private:
-    const PlatformHook sleep_;
+    ManualTicks ticks_;
     TAVO_TimerFramework* framework_ = nullptr;
 };
 

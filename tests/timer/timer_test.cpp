@@ -212,14 +212,14 @@ TEST(TimerFramework, UninitThatCannotDestroyTheMutexFreesTheFrameworkWhenErrnoIs
 
 TEST(TimerFramework, WorkerSleepsOneTickPerRoundInMicroseconds) {
     TickDriver driver(25);
-    EXPECT_EQ(TickDriver::asked_for(), 25000U);
+    EXPECT_EQ(driver.asked_for(), 25000U);
     driver.tick();
-    EXPECT_EQ(TickDriver::asked_for(), 25000U);
+    EXPECT_EQ(driver.asked_for(), 25000U);
 }
 
 TEST(TimerFramework, WorkerSleepsWhatIsLeftOf32BitsForAHugeTick) {
     const TickDriver driver(5000000);
-    EXPECT_EQ(TickDriver::asked_for(), static_cast<useconds_t>(5000000000ULL & 0xFFFFFFFFULL));
+    EXPECT_EQ(driver.asked_for(), static_cast<useconds_t>(5000000000ULL & 0xFFFFFFFFULL));
 }
 
 }  // namespace

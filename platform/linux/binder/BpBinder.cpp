@@ -58,7 +58,7 @@ status_t BpBinder::dump(int fd, const Vector<String16>& args) {
 status_t BpBinder::transact(uint32_t code, const Parcel& data, Parcel* reply, uint32_t flags) {
     if (!isBinderAlive()) return DEAD_OBJECT;
     const status_t status = IPCThreadState::self()->transact(mHandle, code, data, reply, flags);
-    if (status == DEAD_OBJECT) mAlive.store(false, std::memory_order_release);
+    if (status == DEAD_OBJECT && !mayReturn()) mAlive.store(false, std::memory_order_release);
     return status;
 }
 
@@ -115,11 +115,11 @@ void BpBinder::cancelDeathNotification() {
 }
 
 void BpBinder::sendObituary() {
-    mAlive.store(false, std::memory_order_release);
+    mAlive.store(mayReturn(), std::memory_order_release);
     std::vector<Link> links;
     {
         const std::lock_guard<std::mutex> lock(mLock);
-        mObituarySent = true;
+        mObituarySent = !mayReturn();
         links = std::exchange(mLinks, {});
     }
     for (const Link& link : links) {

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "DriverRegistry.h"
+#include "kernel/KernelDriver.h"
 #include "socket/SocketDriver.h"
 
 namespace android {
@@ -19,11 +20,16 @@ constexpr char kTag[] = "ProcessState";
 struct NamedDriver {
     const char* name;
     DriverFactory factory;
+    // Whether it is of use on this machine when none is named.
+    bool (*suits)();
 };
 
-// The first one is opened when none is named.
+// The best comes first.
 std::vector<NamedDriver>& drivers() {
-    static std::vector<NamedDriver>& table = *new std::vector<NamedDriver>{{"socket", openSocketDriver}};
+    static std::vector<NamedDriver>& table = *new std::vector<NamedDriver>{
+        {"kernel", openKernelDriver, isKernelDriverThere},
+        {"socket", openSocketDriver, [] { return true; }},
+    };
     return table;
 }
 
@@ -39,13 +45,17 @@ void registerDriver(const char* name, DriverFactory factory) {
     if (known != drivers().end()) {
         known->factory = factory;
     } else {
-        drivers().push_back({name, factory});
+        drivers().push_back({name, factory, [] { return false; }});
     }
 }
 
+status_t Driver::becomeContextManager(const sp<BBinder>&) { return INVALID_OPERATION; }
+
 std::unique_ptr<Driver> Driver::open(Process& process) {
     const char* name = getenv("BINDER_DRIVER");
-    const auto driver = name != nullptr && *name != '\0' ? find(name) : drivers().begin();
+    const bool isNamed = name != nullptr && *name != '\0';
+    const auto driver =
+        isNamed ? find(name) : std::find_if(drivers().begin(), drivers().end(), [](auto& one) { return one.suits(); });
     if (driver == drivers().end()) {
         __android_log_print(ANDROID_LOG_ERROR, kTag, "BINDER_DRIVER names no driver: %s", name);
         return nullptr;

@@ -51,8 +51,8 @@ public:
         ~Process() = default;
     };
 
-    // The driver that suits this machine: $BINDER_DRIVER names one, otherwise the best there is. `process`
-    // outlives the driver.
+    // The driver that suits this machine: $BINDER_DRIVER names one, otherwise the kernel's where there is one, and
+    // sockets where there is none. `process` outlives the driver.
     static std::unique_ptr<Driver> open(Process& process);
 
     virtual ~Driver() = default;
@@ -62,6 +62,7 @@ public:
     //   DEAD_OBJECT         the object's process is gone, before or during the call
     //   FAILED_TRANSACTION  the parcel or the reply cannot be carried (too large, an invalid descriptor, ...)
     //   BAD_TYPE            no such handle
+    //   INVALID_OPERATION   this process is a copy, made by fork, of one that had the driver open
     // reply may be null; on any failure it stays empty. No lock is held while waiting. A received parcel's buffer is
     // attached with Parcel::ipcSetDataReference; its release function gives back everything that came in
     // it: references, descriptors and memory.
@@ -73,17 +74,22 @@ public:
     virtual void release(int32_t handle) = 0;
 
     // Asks for proxy->sendObituary(), once, on a pool thread, when the process of the object behind handle dies.
-    // DEAD_OBJECT when that has happened already.
+    // DEAD_OBJECT when that has happened already and is known here; otherwise it is told all the same.
     virtual status_t requestDeathNotification(int32_t handle, const wp<BpBinder>& proxy) = 0;
     virtual status_t clearDeathNotification(int32_t handle) = 0;
 
     // The object behind handle 0: the service manager's.
     virtual sp<IBinder> contextObject() = 0;
+    // Makes an object of this process the one behind everybody's handle 0. ALREADY_EXISTS when there is one,
+    // INVALID_OPERATION for a driver that has no use for one.
+    virtual status_t becomeContextManager(const sp<BBinder>& object);
 
     // The most threads of the pool, those that called joinThreadPool(true) not counted.
     virtual void setMaxThreads(size_t count) = 0;
     // Serves incoming transactions on the calling thread, for as long as the process lives.
     virtual void joinThreadPool(bool isMain) = 0;
+    // Says at once what the calling thread would say with its next call.
+    virtual void flushCommands() {}
 
     // Starts no further transaction and waits, for a second at most, for those that run on other threads. Called
     // when the process exits, before static objects go away.

@@ -45,6 +45,10 @@ void IPCThreadState::joinThreadPool(bool isMain) {
     if (Driver* driver = ProcessState::driver()) driver->joinThreadPool(isMain);
 }
 
+void IPCThreadState::flushCommands() {
+    if (Driver* driver = ProcessState::driver()) driver->flushCommands();
+}
+
 IPCThreadState::Serving::Serving(const Identity& caller, uint32_t flags)
     : mCaller(sState.mCaller), mStrictModePolicy(sState.mStrictModePolicy), mFlags(sState.mLastTransactionBinderFlags) {
     sState.mCaller = caller;

@@ -80,7 +80,10 @@ private:
         data.writeString16(name);
         const status_t status = remote()->transact(CHECK_SERVICE_TRANSACTION, data, &reply);
         if (status == NO_ERROR) *service = reply.readStrongBinder();
-        return status;
+        // A service manager that is not there may be on its way like any service.
+        const BpBinder* manager = remote()->remoteBinder();
+        const bool mayCome = status == DEAD_OBJECT && manager != nullptr && manager->handle() == 0;
+        return mayCome ? status_t{NO_ERROR} : status;
     }
 };
 

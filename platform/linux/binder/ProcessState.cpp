@@ -66,6 +66,10 @@ sp<IBinder> ProcessState::getContextObject(const sp<IBinder>&) {
     return mDriver != nullptr ? mDriver->contextObject() : nullptr;
 }
 
+status_t ProcessState::becomeContextManager(const sp<BBinder>& object) {
+    return mDriver != nullptr ? mDriver->becomeContextManager(object) : status_t{NO_INIT};
+}
+
 void ProcessState::startThreadPool() {
     if (!mThreadPoolStarted.exchange(true)) spawnPooledThread(true);
 }

@@ -6,7 +6,7 @@
 #include <algorithm>
 #include <utility>
 
-#include "Forked.h"
+#include "../Forked.h"
 #include "Frame.h"
 #include "Listener.h"
 #include "Wire.h"

@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "Forked.h"
+#include "../Forked.h"
 
 namespace android::socket_driver {
 

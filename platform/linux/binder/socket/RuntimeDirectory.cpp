@@ -3,6 +3,7 @@
 #include <android/log.h>
 #include <dirent.h>
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/random.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -10,10 +11,12 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <thread>
 
 #include "Frame.h"
 
@@ -23,6 +26,9 @@ namespace {
 constexpr char kLogTag[] = "BinderSocket";
 constexpr size_t kMaxNameSize = 255;
 constexpr int kBacklog = 128;
+constexpr size_t kTemporaryLength = 17;
+constexpr int kAttempts = 1000;
+constexpr std::chrono::milliseconds kPause{1};
 
 // A path that everybody on the machine can create must be checked to be this user's before it is used.
 struct Place {
@@ -83,7 +89,33 @@ bool RuntimeDirectory::isValidName(const std::string& name) {
            name.find('\0') == std::string::npos;
 }
 
+// Everybody who is about to publish holds a shared lock on the directory, which ends with the process at the latest.
+// Whoever is alone in it removes what others that were killed there have left. Where the directory cannot be locked, or
+// somebody stands still while he has it to himself, publishing goes on without: names matter more than tidiness.
+UniqueFd RuntimeDirectory::takePart() const {
+    UniqueFd part(openat(directory_.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (!part.valid()) return part;
+    if (flock(part.get(), LOCK_EX | LOCK_NB) == 0) removeAbandoned();
+    for (int i = 0; i < kAttempts && flock(part.get(), LOCK_SH | LOCK_NB) != 0; ++i) {
+        std::this_thread::sleep_for(kPause);
+    }
+    return part;
+}
+
+void RuntimeDirectory::removeAbandoned() const {
+    const std::unique_ptr<DIR, int (*)(DIR*)> entries(opendir(pathOf(directory_.get()).c_str()), closedir);
+    if (entries == nullptr) return;
+    while (const dirent* entry = readdir(entries.get())) {
+        FileId id;
+        const std::string name = entry->d_name;
+        const bool isTemporary = name.size() == kTemporaryLength && name[0] == '.' &&
+                                 name.find_first_not_of("0123456789abcdef", 1) == std::string::npos;
+        if (isTemporary && identify(name, id)) unlinkat(directory_.get(), name.c_str(), 0);
+    }
+}
+
 status_t RuntimeDirectory::listen(Unnamed& unnamed) const {
+    unnamed.presence = takePart();
     unsigned long long random = 0;
     if (getrandom(&random, sizeof random, 0) != sizeof random) return -errno;
     char temporary[32];

@@ -32,6 +32,7 @@ public:
         UniqueFd socket;
         FileId file;
         std::string temporary;
+        UniqueFd presence;  // while it is open, nobody takes the temporary name for one that was left behind
     };
     status_t listen(Unnamed& unnamed) const;
     // In one step: whoever held the name before, alive or dead, is replaced.
@@ -53,6 +54,8 @@ public:
 
 private:
     bool isListenedTo(const char* name) const;
+    UniqueFd takePart() const;
+    void removeAbandoned() const;
 
     UniqueFd directory_;
 };

@@ -8,7 +8,7 @@
 #include <cstring>
 #include <utility>
 
-#include "Forked.h"
+#include "../Forked.h"
 #include "SocketServiceManager.h"
 
 namespace android {

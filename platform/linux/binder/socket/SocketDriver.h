@@ -6,6 +6,7 @@
 #include <optional>
 
 #include "../Driver.h"
+#include "../RunningCalls.h"
 #include "AsyncCalls.h"
 #include "CallChains.h"
 #include "Directory.h"
@@ -14,7 +15,6 @@
 #include "ObjectTranslator.h"
 #include "Poller.h"
 #include "References.h"
-#include "RunningCalls.h"
 #include "ServedChannel.h"
 #include "ThreadBudget.h"
 

@@ -3,7 +3,7 @@
 
 #include <cerrno>
 
-#include "Forked.h"
+#include "../Forked.h"
 #include "SocketDriver.h"
 
 namespace android::socket_driver {

@@ -67,13 +67,14 @@ TEST(ProcessWithoutDriver, HasAServiceManagerThatFindsNothing) {
     EXPECT_EQ(proxy->pingBinder(), NO_INIT);
 }
 
-TEST(DriverChoice, IsTheFirstDriverWhenNoneIsNamedAndOneCanBeReplaced) {
+TEST(DriverChoice, IsTheFirstDriverThatSuitsWhenNoneIsNamedAndOneCanBeReplaced) {
     static int opened = 0;
     registerDriver("socket", [](Driver::Process&) -> std::unique_ptr<Driver> {
         ++opened;
         return nullptr;
     });
     setenv("BINDER_DRIVER", "", 1);
+    setenv("BINDER_DEVICE", "/nowhere/binder", 1);
     const LogCapture log;
     EXPECT_NE(ProcessState::self(), nullptr);
     EXPECT_NE(ProcessState::self(), nullptr);

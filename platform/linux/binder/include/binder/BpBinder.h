@@ -54,6 +54,8 @@ private:
         uint32_t flags;
     };
 
+    // Behind handle 0 is whoever is the service manager at the moment, which may be nobody for a while.
+    bool mayReturn() const { return mHandle == 0; }
     // Takes the driver's death notification back when any is wanted. ProcessState calls it while this object is
     // still the handle's one proxy, so that it cannot hit the notification of the next one.
     void cancelDeathNotification();

@@ -36,8 +36,8 @@ public:
 
     // Serves calls on this thread for as long as the process lives. Returns at once without a driver.
     void joinThreadPool(bool isMain = true);
-    // Nothing waits to be sent: every call goes out when it is made.
-    void flushCommands() {}
+    // Calls go out when they are made. What is given back to others may wait for the thread's next call, or for this.
+    void flushCommands();
     // There is no background scheduling to be disabled.
     static void disableBackgroundScheduling(bool) {}
 

@@ -10,6 +10,7 @@
 
 namespace android {
 
+class BBinder;
 class BpBinder;
 class Driver;
 
@@ -23,6 +24,9 @@ public:
 
     // The service manager's object; null without a driver. The caller does not matter.
     sp<IBinder> getContextObject(const sp<IBinder>& caller);
+    // Makes an object of this process the service manager's. ALREADY_EXISTS where there is a service manager, NO_INIT
+    // without a driver, INVALID_OPERATION where the driver does not need one.
+    status_t becomeContextManager(const sp<BBinder>& object);
 
     // Starts serving calls on threads of the process's own. Every call after the first does nothing.
     void startThreadPool();
