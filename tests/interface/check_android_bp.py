@@ -84,6 +84,9 @@ def complete(module, modules):
     return whole
 
 
+# What CMake gives some files alone and Android.bp all of them, where it does no harm.
+EVERYWHERE = {'-U_FORTIFY_SOURCE'}
+
 differences = []
 
 
@@ -97,11 +100,13 @@ def compare_library(modules, cmake):
     library = modules['libtavoosal']
     unwindable = modules['libtavoosal_unwindable']
     # What CMake gives single files is, there, a library of its own.
-    special = {source: options for source, options in cmake['source_options'].items() if options}
+    special = {source: options for source, options in cmake['source_options'].items() if set(options) - EVERYWHERE}
     compare('library', library['srcs'] + unwindable['srcs'], cmake['sources'])
     compare('files with options of their own', unwindable['srcs'], special)
     for source, options in special.items():
         compare(f'options of {source}', unwindable['cflags'], library['cflags'] + options)
+    for source, options in cmake['source_options'].items():
+        compare(f'options of {source}', EVERYWHERE & set(library['cflags']), EVERYWHERE & set(options) or EVERYWHERE)
     compare('linked in whole', library['whole_static_libs'], ['libtavoosal_unwindable'])
     for module in (library, unwindable):
         name = module['name']
@@ -118,13 +123,13 @@ def definitions(module):
 
 
 def warnings(module):
-    own = ['-fno-exceptions', '-fasynchronous-unwind-tables', '-fexceptions']
+    own = ['-fno-exceptions', '-fasynchronous-unwind-tables', '-fexceptions', *EVERYWHERE]
     flags = module['cflags'] + module['cppflags']
     return [flag for flag in flags if not flag.startswith('-D') and flag not in own]
 
 
 def compare_tests(modules, cmake):
-    compare('test support', modules['libtavoosal_test_support']['srcs'], cmake['support'])
+    compare('test support', modules['libtavoosal_test_support']['srcs'], cmake['support'] + cmake['kit'])
     tests = {name: module for name, module in modules.items() if module['type'] == 'cc_test'}
     compare('tests', tests, [f'tavoosal_{name}' for name in cmake['tests']])
     for name, sources in cmake['tests'].items():
