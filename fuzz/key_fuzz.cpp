@@ -29,7 +29,7 @@ constexpr char kQueueKeyFile[] = TAVO_STORAGE_ROOT "/key_gen_file.txt";
 void write_file(const char* path, const ByteString& bytes) {
     FILE* file = fopen(path, "we");
     require(file != nullptr, "the files can be made");
-    fwrite(bytes.data(), 1, bytes.size(), file);
+    if (!bytes.empty()) fwrite(bytes.data(), 1, bytes.size(), file);
     fclose(file);
 }
 

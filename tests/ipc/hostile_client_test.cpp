@@ -51,6 +51,9 @@ protected:
 
     // The server may have a hundred descriptors from now on.
     void limit_descriptors() {
+        // Sanitizers need descriptors of their own when they meet a class for the first time.
+        service_->get_shared_mem(kKey, 100);
+        service_->delete_shared_mem(kKey);
         server_->take_descriptors();
         server_->give_descriptors();
     }
