@@ -69,17 +69,39 @@ for ((slot = 0; slot < slots; ++slot)); do
     arguments+=(-chardev "pipe,id=slot$slot,path=$guest/slot$slot" -device "virtserialport,chardev=slot$slot,name=slot$slot")
 done
 
-exec {running}>"$guest/running"
-flock "$running"
-timeout --signal=KILL 1200 "${arguments[@]}" </dev/null >"$guest/qemu" 2>&1 &
-echo $! >"$guest/pid"
-exec {running}>&-
-for ((slot = 0; slot < slots; ++slot)); do
-    exec {output}<>"$guest/slot$slot.out"
-    until read -r -t 1 -u "$output" line && [[ $line == "=== ready" ]]; do
-        if flock --shared --nonblock "$guest/running" true; then
-            cat "$guest/qemu" "$guest/console" >&2
-            die "the guest ended before it was ready: its last words are above"
-        fi
+start() {
+    exec {running}>"$guest/running"
+    flock "$running"
+    timeout --signal=KILL 1200 "${arguments[@]}" </dev/null >"$guest/qemu" 2>&1 &
+    echo $! >"$guest/pid"
+    exec {running}>&-
+}
+
+is_ready() { # whether every slot has said so, in time
+    local slot output line deadline=$((SECONDS + 120))
+    for ((slot = 0; slot < slots; ++slot)); do
+        exec {output}<>"$guest/slot$slot.out"
+        until read -r -t 1 -u "$output" line && [[ $line == "=== ready" ]]; do
+            if flock --shared --nonblock "$guest/running" true; then
+                cat "$guest/qemu" "$guest/console" >&2
+                die "the guest ended before it was ready: its last words are above"
+            fi
+            if ((SECONDS > deadline)); then
+                exec {output}>&-
+                return 1
+            fi
+        done
+        exec {output}>&-
     done
+}
+
+# An emulated machine stands still now and then before its kernel has said a word.
+for attempt in 1 2 3; do
+    start
+    if is_ready; then exit 0; fi
+    cat "$guest/console" >&2
+    echo "boot.sh: the guest was not ready in time (attempt $attempt)" >&2
+    kill "$(<"$guest/pid")" || true
+    flock -w 10 "$guest/running" true || die "the guest cannot be ended"
 done
+die "the guest does not start"
