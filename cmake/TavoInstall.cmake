@@ -56,6 +56,12 @@ foreach(tool IN ITEMS tavo servicemanager)
     endif()
 endforeach()
 
+if(TARGET tavo)
+    # bash-completion loads what is named like the command.
+    install(FILES "${PROJECT_SOURCE_DIR}/tools/tavo.bash" RENAME tavo
+        DESTINATION "${CMAKE_INSTALL_DATAROOTDIR}/bash-completion/completions" COMPONENT tools)
+endif()
+
 # Manual pages: the tools' with the tools, what programmers read with the headers.
 file(GLOB manual_pages CONFIGURE_DEPENDS "${PROJECT_SOURCE_DIR}/docs/man/*.[1-8]")
 foreach(page IN LISTS manual_pages)

@@ -25,6 +25,10 @@ constexpr uint64_t kLittleSpace = 1 << 20;
 constexpr unsigned long kFewDescriptors = 256;
 constexpr long kLargestPipe = 1 << 20;
 
+std::string counted(size_t count, const char* what) {
+    return std::to_string(count) + " " + what + (count == 1 ? "" : "s");
+}
+
 std::string mode_of(const struct stat& status) {
     char text[16];
     snprintf(text, sizeof text, "%04o", status.st_mode & 07777U);
@@ -107,8 +111,8 @@ void check_service(Findings& findings) {
         const std::string process = "process " + std::to_string(figures.process);
         if (figures.has_queue_table && figures.has_block_list) {
             findings.push_back({Health::kGood, "service",
-                                process + " answers, with " + std::to_string(figures.queues.size()) + " queues and " +
-                                    std::to_string(figures.blocks.size()) + " blocks",
+                                process + " answers, with " + counted(figures.queues.size(), "queue") + " and " +
+                                    counted(figures.blocks.size(), "block"),
                                 ""});
         } else {
             findings.push_back({Health::kProblem, "service", process + " could not initialise its tables",

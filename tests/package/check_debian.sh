@@ -55,6 +55,7 @@ if grep -E '/include/|\.so$|\.a$|/man3/' "$work/libtavoosal0.list" | grep -v lib
     fail "libtavoosal0: development files as above"
 fi
 if [[ -f $work/tavo-tools.list ]]; then
+    has tavo-tools usr/bin/tavo usr/share/bash-completion/completions/tavo
     while read -r page; do has tavo-tools "usr/share/man/.*/$(basename "$page" | sed 's/[.]/\\./g')\.gz"; done < <(
         find "$source/docs/man" -name '*.[158]' ! -name tavo-private-storage.1)
 fi

@@ -26,6 +26,10 @@ while read -r file; do
     [[ $runpath != *"$build"* && $runpath != *"$work"* && $runpath != *::* ]] || fail "$file has the RUNPATH $runpath"
 done < <(find "$prefix" -type f \( -name '*.so*' -o -path '*/bin/*' \))
 
+if [[ -e $prefix/bin/tavo ]]; then
+    cmp "$source/tools/tavo.bash" "$prefix/share/bash-completion/completions/tavo" || fail "completion for bash"
+fi
+
 run() { # NAME PROGRAM EXPECTED_LINE ...: in the sandbox, with these lines in its output, in this order
     local name=$1 program=$2 output
     shift 2

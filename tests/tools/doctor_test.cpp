@@ -56,6 +56,14 @@ TEST_F(Doctor, IsContentWithAServiceThatRuns) {
     EXPECT_FALSE(on("service").contains("advice"));
 }
 
+TEST_F(Doctor, CountsQueuesAndBlocks) {
+    serve();
+    ASSERT_TRUE(succeeded(tavo({"send", "7", "text"})));
+    for (const char* key : {"8", "9"}) ASSERT_TRUE(succeeded(tavo({"shm", "create", key, "4K"})));
+    EXPECT_EQ(on("service")["finding"],
+              "process " + std::to_string(server().pid()) + " answers, with 1 queue and 2 blocks");
+}
+
 TEST_F(Doctor, NotesThatNoServiceWasEverThere) {
     EXPECT_EQ(on("service"), (json{{"health", "note"},
                                    {"subject", "service"},
