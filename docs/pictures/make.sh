@@ -18,8 +18,8 @@ tests/support/sandbox.sh docs/pictures/busy.sh "$build/tools/tavo" \
 
 # What would tell whose machine it was.
 for picture in "$new"/*.svg; do
-    for private in "$PWD" "$build" "${HOME%/}/" "$(hostname)" "$(id -un)"; do
-        if grep -qwF -e "$private" "$picture"; then
+    for private in "$PWD" "$build" "${HOME-}" "$(hostname)" "$(id -un)"; do
+        if [[ ${#private} -gt 1 ]] && grep -qwF -e "$private" "$picture"; then
             echo "$(basename "$picture") shows '$private'" >&2
             exit 1
         fi
