@@ -140,7 +140,7 @@ bool uses_kernel_driver() {
 }
 
 std::string runtime_directory() {
-    if (const std::string chosen = value_of("BINDER_RUNTIME_DIR"); !chosen.empty()) return chosen;
+    if (std::string chosen = value_of("BINDER_RUNTIME_DIR"); !chosen.empty()) return chosen;
     if (const std::string session = value_of("XDG_RUNTIME_DIR"); !session.empty()) return session + "/binder";
     return "/tmp/binder-" + std::to_string(geteuid());
 }

@@ -83,7 +83,7 @@ TEST_F(Sem, BadKeysAreMisuse) {
 }
 
 TEST_F(Sem, FilesThatHoldNoneAreRefusedAndLeftAlone) {
-    std::ofstream("/sdcard/5") << "somebody's notes";
+    std::ofstream("/sdcard/5") << "somebody else's notes";
     constexpr char kForeign[] = "/sdcard/5 holds no semaphore, and is left as it is: take another key";
     for (const char* command : {"init", "wait", "post", "get", "destroy"}) {
         EXPECT_TRUE(failed(tavo({"sem", command, "5"}), 1, kForeign)) << command;
