@@ -141,7 +141,7 @@ void add_sem(CLI::App& app, Run& run) {
     sem->require_subcommand(1);
     CLI::App* command = nullptr;
     const auto add = [&](const char* name, const char* text, int (*action)(const Options&)) {
-        const auto options = add_command<Options>(*sem, run, name, text, action, command);
+        auto options = add_command<Options>(*sem, run, name, text, action, command);
         command->add_option("KEY", options->key, "The semaphore's key, 0 to 4294967295")->required();
         return options;
     };
