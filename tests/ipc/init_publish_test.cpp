@@ -4,8 +4,8 @@
 #include "ipc/ITavoBinder.h"
 #include "ipc/allocation_fault.h"
 #include "ipc/descriptors.h"
-#include "ipc/eventually.h"
 #include "ipc/init_test.h"
+#include "support/eventually.h"
 #include "support/log_capture.h"
 #include "tavo_osal/init.h"
 

@@ -12,8 +12,8 @@
 #include <fstream>
 #include <string>
 
-#include "ipc/eventually.h"
 #include "ipc/server.h"
+#include "support/eventually.h"
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
 #include "support/process.h"

@@ -5,9 +5,9 @@
 #include <nlohmann/json.hpp>
 
 #include "ipc/descriptors.h"
-#include "ipc/eventually.h"
 #include "ipc/osal_service_dump_test.h"
 #include "ipc/server.h"
+#include "support/eventually.h"
 #include "support/log_capture.h"
 #include "tavo_osal.h"
 

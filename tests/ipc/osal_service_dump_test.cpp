@@ -10,8 +10,8 @@
 
 #include "ipc/TAVO_MessageQueue.h"
 #include "ipc/descriptors.h"
-#include "ipc/eventually.h"
 #include "ipc/osal_service_test.h"
+#include "support/eventually.h"
 #include "support/process.h"
 
 namespace {

@@ -12,9 +12,9 @@
 #include <thread>
 #include <vector>
 
-#include "ipc/eventually.h"
 #include "ipc/server.h"
 #include "ipc/shared_memory_test.h"
+#include "support/eventually.h"
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
 #include "support/process.h"

@@ -11,9 +11,9 @@
 #include <fstream>
 #include <string>
 
-#include "ipc/eventually.h"
 #include "ipc/server.h"
 #include "ipc/shared_memory_test.h"
+#include "support/eventually.h"
 #include "support/pace.h"
 #include "support/process.h"
 

@@ -25,17 +25,7 @@ protected:
 class AcquireCrash : public BlockCrash, public testing::WithParamInterface<const char*> {};
 
 TEST_P(AcquireCrash, AnywhereInAnAcquireLeavesAtMostItsUse) {
-    const Holdings server(server_.pid());
-    int uses = 0;
-    const int points = kill_everywhere(GetParam(), "", "acquire 7 100000", [&] {
-        const int taken = take_block_uses(7);
-        EXPECT_TRUE(taken == 0 || taken == 1) << taken;
-        uses += taken;
-        EXPECT_TRUE(comes_back_to(server, server_.pid()));
-    });
-    EXPECT_GE(points, 1);
-    EXPECT_GE(uses, 1);  // some of the points are behind the service's reply
-    expect_service();
+    expect_at_most_its_use_left(GetParam(), "acquire 7 100000", [] { return take_block_uses(7); });
 }
 
 INSTANTIATE_TEST_SUITE_P(At, AcquireCrash,

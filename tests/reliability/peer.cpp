@@ -12,8 +12,8 @@
 #include <sstream>
 #include <vector>
 
-#include "ipc/eventually.h"
 #include "reliability/crash_point.h"
+#include "support/eventually.h"
 #include "tavo_osal/init.h"
 #include "tavo_osal/ipc_semaphore.h"
 #include "tavo_osal/msg_queue.h"

@@ -160,17 +160,7 @@ constexpr const char* kCalls[] = {
 class AttachCrash : public QueueCrash, public testing::WithParamInterface<const char*> {};
 
 TEST_P(AttachCrash, AnywhereInAnAttachLeavesAtMostItsUse) {
-    const Holdings server(server_.pid());
-    int uses = 0;
-    const int points = kill_everywhere(GetParam(), "", "attach 7", [&] {
-        const int taken = take_queue_uses(7);
-        EXPECT_TRUE(taken == 0 || taken == 1) << taken;
-        uses += taken;
-        EXPECT_TRUE(comes_back_to(server, server_.pid()));
-    });
-    EXPECT_GE(points, 1);
-    EXPECT_GE(uses, 1);  // some of the points are behind the service's reply
-    expect_service();
+    expect_at_most_its_use_left(GetParam(), "attach 7", [] { return take_queue_uses(7); });
 }
 
 INSTANTIATE_TEST_SUITE_P(At, AttachCrash, testing::ValuesIn(kCalls),

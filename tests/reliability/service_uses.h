@@ -9,10 +9,10 @@
 #include <string>
 
 #include "ipc/ITavoBinder.h"
-#include "ipc/eventually.h"
 #include "ipc/msg_queue_test.h"
 #include "ipc/shared_memory_test.h"
 #include "reliability/peer.h"
+#include "support/eventually.h"
 
 namespace tavo::test {
 
@@ -91,6 +91,22 @@ protected:
         EXPECT_EQ(fresh.ask("see 98"), "0");
         EXPECT_EQ(fresh.ask("release 98"), kDone);
         EXPECT_EQ(fresh.ask("delete 98 100"), kDone);
+    }
+    // Wherever a client is killed in a command that takes a use, that use is all it leaves, and at some of the points,
+    // those behind the service's reply, it does. `take` takes the uses back and counts them.
+    void expect_at_most_its_use_left(const std::string& calls, const std::string& command,
+                                     const std::function<int()>& take) {
+        const Holdings server(server_.pid());
+        int uses = 0;
+        const int points = kill_everywhere(calls, "", command, [&] {
+            const int taken = take();
+            EXPECT_TRUE(taken == 0 || taken == 1) << taken;
+            uses += taken;
+            EXPECT_TRUE(comes_back_to(server, server_.pid()));
+        });
+        EXPECT_GE(points, 1);
+        EXPECT_GE(uses, 1);
+        expect_service();
     }
 
     Peer server_;

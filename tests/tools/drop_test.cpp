@@ -9,6 +9,7 @@ namespace {
 
 using nlohmann::json;
 using tavo::test::failed;
+using tavo::test::listed;
 using tavo::test::Running;
 using tavo::test::ServedTest;
 using tavo::test::succeeded;
@@ -16,7 +17,7 @@ using tavo::test::tavo;
 
 class Drop : public ServedTest {
 protected:
-    static json queues() { return json::parse(tavo({"list", "--json"}).out)["queues"]; }
+    static json queues() { return listed()["queues"]; }
 };
 
 TEST_F(Drop, GivesBackTheUseThatASenderLeft) {

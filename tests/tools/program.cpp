@@ -136,6 +136,8 @@ Result tavo(const Words& arguments, const std::string& input, const Variables& v
 
 Result tavo_with_output_to(const char* path, const Words& arguments) { return run(arguments, "", {}, path); }
 
+nlohmann::json listed() { return nlohmann::json::parse(tavo({"list", "--json"}).out); }
+
 void without_the_rights_of_root() {
     // What cannot be dropped has been dropped already.
     prctl(PR_CAPBSET_DROP, CAP_DAC_OVERRIDE);

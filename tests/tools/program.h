@@ -6,6 +6,7 @@
 
 #include <map>
 #include <memory>
+#include <nlohmann/json.hpp>
 #include <string>
 #include <vector>
 
@@ -27,6 +28,9 @@ std::ostream& operator<<(std::ostream& out, const Result& result);
 Result tavo(const Words& arguments, const std::string& input = "", const Variables& variables = {});
 // The same, with one of its descriptors on a file instead.
 Result tavo_with_output_to(const char* path, const Words& arguments);
+
+// What "tavo list" tells programs of the service.
+nlohmann::json listed();
 
 // Programs that are started from now on are held to the permissions of files, even if they belong to root.
 void without_the_rights_of_root();

@@ -12,6 +12,7 @@ namespace {
 
 using nlohmann::json;
 using tavo::test::failed;
+using tavo::test::listed;
 using tavo::test::Running;
 using tavo::test::ServedTest;
 using tavo::test::succeeded;
@@ -21,7 +22,7 @@ using tavo::test::tavo_with_output_to;
 class RecvOutput : public ServedTest {
 protected:
     static void send(const std::string& text) { EXPECT_TRUE(succeeded(tavo({"send", "7", "-"}, text))); }
-    static json queue() { return json::parse(tavo({"list", "--json"}).out)["queues"].at(0); }
+    static json queue() { return listed()["queues"].at(0); }
 };
 
 TEST_F(RecvOutput, OnAFullDiskTheMessageIsPutBack) {

@@ -9,6 +9,7 @@ namespace {
 
 using nlohmann::json;
 using tavo::test::failed;
+using tavo::test::listed;
 using tavo::test::OnTerminal;
 using tavo::test::Result;
 using tavo::test::Running;
@@ -19,7 +20,7 @@ using tavo::test::tavo;
 class Recv : public ServedTest {
 protected:
     static void send(const std::string& text) { EXPECT_TRUE(succeeded(tavo({"send", "7", "-"}, text))); }
-    static json queues() { return json::parse(tavo({"list", "--json"}).out)["queues"]; }
+    static json queues() { return listed()["queues"]; }
 };
 
 TEST_F(Recv, OneMessageAsItsBytes) {

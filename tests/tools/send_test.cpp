@@ -13,6 +13,7 @@ namespace {
 
 using nlohmann::json;
 using tavo::test::failed;
+using tavo::test::listed;
 using tavo::test::OnTerminal;
 using tavo::test::Result;
 using tavo::test::Running;
@@ -25,7 +26,7 @@ constexpr size_t kMaxSize = 409600;
 
 class Send : public ServedTest {
 protected:
-    static json queue() { return json::parse(tavo({"list", "--json"}).out)["queues"].at(0); }
+    static json queue() { return listed()["queues"].at(0); }
     static std::string received(const char* key = "7", const Words& more = {}) {
         Words words = {"recv", "--timeout", "0"};
         words.insert(words.end(), more.begin(), more.end());
@@ -75,7 +76,7 @@ TEST_F(Send, KeepsItsMessagesForWhoeverComesNext) {
 TEST_F(Send, LeavesNoUseWhereSomebodyElseIsAttached) {
     Running receiver({"recv", "7", "--follow", "--lines"});
     do {
-    } while (json::parse(tavo({"list", "--json"}).out)["queues"].empty());
+    } while (listed()["queues"].empty());
     EXPECT_TRUE(succeeded(tavo({"send", "7", "text"})));
     EXPECT_EQ(receiver.read_until("\n"), "text\n");
     EXPECT_EQ(queue()["uses"], 1);
@@ -106,7 +107,7 @@ TEST_F(Send, EachLineAsAMessage) {
 
 TEST_F(Send, NothingButAnEmptyInputWhenThereAreNoLines) {
     EXPECT_TRUE(succeeded(tavo({"send", "7", "-", "--lines"}, "")));
-    EXPECT_TRUE(json::parse(tavo({"list", "--json"}).out)["queues"].empty());
+    EXPECT_TRUE(listed()["queues"].empty());
     EXPECT_TRUE(succeeded(tavo({"send", "7", "-"}, "")));
     EXPECT_EQ(queue()["pending"], 4);
 }
@@ -128,7 +129,7 @@ TEST_F(Send, NoLongerOne) {
     EXPECT_TRUE(failed(tavo({"send", "7", "-f", file_with(too_long)}), 1,
                        "/sdcard/input is too long: a message has at most 409600 bytes: use --lines to send each line "
                        "as a message, or split it"));
-    EXPECT_TRUE(json::parse(tavo({"list", "--json"}).out)["queues"].empty());
+    EXPECT_TRUE(listed()["queues"].empty());
 }
 
 TEST_F(Send, LinesUpToTheOneThatIsTooLong) {

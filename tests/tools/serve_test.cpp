@@ -16,6 +16,7 @@ namespace {
 
 using nlohmann::json;
 using tavo::test::failed;
+using tavo::test::listed;
 using tavo::test::Result;
 using tavo::test::Running;
 using tavo::test::succeeded;
@@ -29,12 +30,10 @@ std::string ready_line(pid_t pid, unsigned queues, unsigned blocks) {
            " queues and " + std::to_string(blocks) + " blocks\n";
 }
 
-json figures() { return json::parse(tavo({"list", "--json"}).out); }
-
 TEST_F(Serve, SaysInOneLineThatItIsReady) {
     Running server({"serve"});
     EXPECT_EQ(server.read_until("\n"), ready_line(server.pid(), 25, 25));
-    EXPECT_EQ(figures()["process"], server.pid());
+    EXPECT_EQ(listed()["process"], server.pid());
     server.signal(SIGTERM);
     EXPECT_EQ(server.wait(), 0);
     EXPECT_EQ(server.read_rest(), "");
@@ -43,8 +42,8 @@ TEST_F(Serve, SaysInOneLineThatItIsReady) {
 TEST_F(Serve, HandsTheLimitsToTheService) {
     Running server({"serve", "--queues", "3", "--blocks", "4"});
     EXPECT_EQ(server.read_until("\n"), ready_line(server.pid(), 3, 4));
-    EXPECT_EQ(figures()["queue_room"], 3);
-    EXPECT_EQ(figures()["block_limit"], 4);
+    EXPECT_EQ(listed()["queue_room"], 3);
+    EXPECT_EQ(listed()["block_limit"], 4);
 }
 
 TEST_F(Serve, RefusesLimitsThatTheServiceCannotTake) {
@@ -79,8 +78,8 @@ TEST_F(Serve, RefusesToTakeAnothersPlaceUnlessAsked) {
                        "blocks stay behind with it)"));
     Running other({"serve", "--replace"});
     EXPECT_EQ(other.read_until("\n"), ready_line(other.pid(), 25, 25));
-    EXPECT_EQ(figures()["process"], other.pid());
-    EXPECT_TRUE(figures()["queues"].empty());
+    EXPECT_EQ(listed()["process"], other.pid());
+    EXPECT_TRUE(listed()["queues"].empty());
 }
 
 TEST_F(Serve, WithoutStorageSaysWhatToMake) {

@@ -8,6 +8,7 @@ namespace {
 
 using nlohmann::json;
 using tavo::test::failed;
+using tavo::test::listed;
 using tavo::test::Result;
 using tavo::test::ServedTest;
 using tavo::test::succeeded;
@@ -15,7 +16,7 @@ using tavo::test::tavo;
 
 class Shm : public ServedTest {
 protected:
-    static json blocks() { return json::parse(tavo({"list", "--json"}).out)["blocks"]; }
+    static json blocks() { return listed()["blocks"]; }
     static void create(const char* key, const char* size) {
         EXPECT_TRUE(succeeded(tavo({"shm", "create", key, size})));
     }

@@ -10,6 +10,7 @@ namespace {
 
 using nlohmann::json;
 using tavo::test::failed;
+using tavo::test::listed;
 using tavo::test::OnTerminal;
 using tavo::test::Result;
 using tavo::test::Running;
@@ -47,8 +48,8 @@ TEST_F(Top, ShowsHowFullAPipeIs) {
     const json empty = json::parse(tavo({"top", "--json"}).out);
     EXPECT_TRUE(empty["queues"].empty());
     fill(4092);
-    const size_t capacity = json::parse(tavo({"list", "--json"}).out)["queues"][0]["capacity"];
-    while (json::parse(tavo({"list", "--json"}).out)["queues"][0]["pending"] < capacity) {
+    const size_t capacity = listed()["queues"][0]["capacity"];
+    while (listed()["queues"][0]["pending"] < capacity) {
         ASSERT_EQ(tavo({"send", "7", std::string(4092, 'x'), "--timeout", "0"}).status, 0);
     }
     EXPECT_NE(tavo({"top"}).out.find("[####################] 100%\n"), std::string::npos);

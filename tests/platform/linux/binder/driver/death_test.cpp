@@ -78,7 +78,7 @@ TEST(DriverDeath, IsToldToEveryRecipientOnce) {
     EXPECT_EQ(service->linkToDeath(gone), OK);
     EXPECT_EQ(service->unlinkToDeath(gone), OK);
     server.kill(SIGKILL);
-    EXPECT_TRUE(eventually([&] { return one->deaths == 1 && other->deaths == 1; }));
+    EXPECT_TRUE(comes_true([&] { return one->deaths == 1 && other->deaths == 1; }));
     EXPECT_EQ(one->last, service);
     EXPECT_FALSE(service->isBinderAlive());
     EXPECT_EQ(service->linkToDeath(one), DEAD_OBJECT);
@@ -104,7 +104,7 @@ TEST(DriverDeath, IsToldWhileCallsAreUnderWay) {
         std::this_thread::sleep_for(std::chrono::milliseconds(5));
         server.kill(SIGKILL);
         for (std::thread& caller : callers) caller.join();
-        EXPECT_TRUE(eventually([&] { return recipient->deaths == 1; }));
+        EXPECT_TRUE(comes_true([&] { return recipient->deaths == 1; }));
     }
 }
 
@@ -142,7 +142,7 @@ TEST(DriverDeath, OfAClientIsToldToTheServer) {
     ASSERT_EQ(ask(service, TestService::kWatchKept), OK);
     EXPECT_EQ(ask(service, TestService::kDeaths), 0);
     client.kill(SIGKILL);
-    EXPECT_TRUE(eventually([&] { return ask(service, TestService::kDeaths) == 1; }));
+    EXPECT_TRUE(comes_true([&] { return ask(service, TestService::kDeaths) == 1; }));
     EXPECT_EQ(ask(service, TestService::kPingKept), DEAD_OBJECT);
 }
 
@@ -165,7 +165,7 @@ TEST(DriverDeath, OfClientsLeavesNothingBehind) {
         for (Process& client : clients) EXPECT_EQ(client.wait(), -SIGKILL);
     };
     const auto settled = [&](size_t descriptors) {
-        return eventually([&] { return count_descriptors(server.pid()) <= descriptors; });
+        return comes_true([&] { return count_descriptors(server.pid()) <= descriptors; });
     };
     kill_some();
     std::this_thread::sleep_for(std::chrono::milliseconds(200));

@@ -113,14 +113,14 @@ TEST_F(DriverIntroduction, KeepsTheObjectAlive) {
     EXPECT_EQ(TestService::count(), 1);
     EXPECT_EQ(ask(c_, TestService::kPingKept), OK);
     ASSERT_EQ(ask(c_, TestService::kKeep, nullptr), 0);
-    EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
+    EXPECT_TRUE(comes_true([] { return TestService::count() == 0; }));
 }
 
 TEST_F(DriverIntroduction, TellsOfTheOwnersDeath) {
     ASSERT_EQ(ask(c_, TestService::kKeep, b_), 0);
     ASSERT_EQ(ask(c_, TestService::kWatchKept), OK);
     process_b_.kill(SIGKILL);
-    EXPECT_TRUE(eventually([&] { return ask(c_, TestService::kDeaths) == 1; }));
+    EXPECT_TRUE(comes_true([&] { return ask(c_, TestService::kDeaths) == 1; }));
     EXPECT_EQ(ask(c_, TestService::kPingKept), DEAD_OBJECT);
 }
 
@@ -131,7 +131,7 @@ TEST_F(DriverIntroduction, TellsOfADeathOnceWhenKnownTwice) {
     ASSERT_EQ(ask(c_, TestService::kIsKeptNamed, name), 1) << "on a link of its own as well";
     ASSERT_EQ(ask(c_, TestService::kWatchKept), OK);
     process_b_.kill(SIGKILL);
-    EXPECT_TRUE(eventually([&] { return ask(c_, TestService::kDeaths) == 1; }));
+    EXPECT_TRUE(comes_true([&] { return ask(c_, TestService::kDeaths) == 1; }));
     std::this_thread::sleep_for(std::chrono::milliseconds(100));
     EXPECT_EQ(ask(c_, TestService::kDeaths), 1);
 }
@@ -150,7 +150,7 @@ TEST_F(DriverIntroduction, LeavesNoConnectionBehind) {
     std::this_thread::sleep_for(std::chrono::milliseconds(100));
     const std::vector<size_t> before = descriptors();
     for (int i = 0; i < 50; ++i) pass();
-    EXPECT_TRUE(eventually([&] {
+    EXPECT_TRUE(comes_true([&] {
         const std::vector<size_t> now = descriptors();
         return now[0] <= before[0] && now[1] <= before[1] && now[2] <= before[2];
     })) << testing::PrintToString(before)

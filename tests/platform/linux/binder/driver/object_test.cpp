@@ -67,7 +67,7 @@ TEST(DriverObject, GoesAwayWhenNobodyKeepsIt) {
     std::this_thread::sleep_for(std::chrono::milliseconds(50));
     EXPECT_EQ(TestService::count(), 1);
     ASSERT_EQ(ask(service, TestService::kKeep, nullptr), 0);
-    EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
+    EXPECT_TRUE(comes_true([] { return TestService::count() == 0; }));
 }
 
 TEST(DriverObject, GoesAwayWithItsLastHolder) {
@@ -75,7 +75,7 @@ TEST(DriverObject, GoesAwayWithItsLastHolder) {
     Process server = start_server();
     ASSERT_EQ(ask(find_service(), TestService::kKeep, new TestService), 0);
     server.kill(SIGKILL);
-    EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
+    EXPECT_TRUE(comes_true([] { return TestService::count() == 0; }));
 }
 
 // The reply that gives it back races with the news that it is given up.
@@ -102,7 +102,7 @@ TEST(DriverObject, SurvivesBeingGivenBackAndUpAtOnce) {
         });
     }
     for (std::thread& thread : threads) thread.join();
-    EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
+    EXPECT_TRUE(comes_true([] { return TestService::count() == 0; }));
     EXPECT_EQ(service->pingBinder(), OK);
 }
 
@@ -138,7 +138,7 @@ TEST(DriverObject, MayBeOneOfThousands) {
         ASSERT_EQ(service->transact(TestService::kEcho, data, &reply), OK);
         for (const sp<IBinder>& object : objects) ASSERT_EQ(reply.readStrongBinder(), object);
     }
-    EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
+    EXPECT_TRUE(comes_true([] { return TestService::count() == 0; }));
 }
 
 TEST(DriverObject, MayBeDeadAlreadyWhenItIsPassedOn) {

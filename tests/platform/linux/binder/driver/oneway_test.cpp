@@ -34,7 +34,7 @@ TEST(DriverOneway, ReturnsBeforeTheCallRan) {
     ASSERT_EQ(append(service, 1, 1000), OK);
     EXPECT_LT(steady_clock::now() - start, std::chrono::milliseconds(900));
     EXPECT_TRUE(appended(service).empty());
-    EXPECT_TRUE(eventually([&] { return appended(service).size() == 1; }));
+    EXPECT_TRUE(comes_true([&] { return appended(service).size() == 1; }));
 }
 
 TEST(DriverOneway, RunsInOrderOneAtATime) {
@@ -46,7 +46,7 @@ TEST(DriverOneway, RunsInOrderOneAtATime) {
         // The earlier ones take longer, so that any two at once would change places.
         ASSERT_EQ(append(service, n, n < 50 ? 1 : 0), OK);
     }
-    EXPECT_TRUE(eventually([&] { return appended(service).size() == expected.size(); }));
+    EXPECT_TRUE(comes_true([&] { return appended(service).size() == expected.size(); }));
     EXPECT_EQ(appended(service), expected);
 }
 
@@ -60,7 +60,7 @@ TEST(DriverOneway, OfSeveralClientsIsRunOneAtATime) {
         });
     }
     for (std::thread& thread : threads) thread.join();
-    ASSERT_TRUE(eventually([&] { return appended(service).size() == 200; }));
+    ASSERT_TRUE(comes_true([&] { return appended(service).size() == 200; }));
     std::vector<int32_t> next(4, 0);
     for (const int32_t number : appended(service)) EXPECT_EQ(number % 1000, next[static_cast<size_t>(number / 1000)]++);
 }
@@ -75,7 +75,7 @@ TEST(DriverOneway, HoldsUpNobodyElse) {
     EXPECT_EQ(service->pingBinder(), OK) << "calls that somebody waits for do not queue";
     EXPECT_TRUE(appended(service).empty());
     gate.open();
-    EXPECT_TRUE(eventually([&] { return appended(service).size() == 1; }));
+    EXPECT_TRUE(comes_true([&] { return appended(service).size() == 1; }));
 }
 
 TEST(DriverOneway, IsAcceptedWhileAllThreadsAreBusy) {
@@ -90,7 +90,7 @@ TEST(DriverOneway, IsAcceptedWhileAllThreadsAreBusy) {
     for (int32_t n = 0; n < 10; ++n) EXPECT_EQ(append(service, n), OK);
     gate.open();
     for (std::thread& caller : callers) caller.join();
-    EXPECT_TRUE(eventually([&] { return appended(service).size() == 10; }));
+    EXPECT_TRUE(comes_true([&] { return appended(service).size() == 10; }));
 }
 
 TEST(DriverOneway, IsAcceptedByAProcessWithoutAPool) {
@@ -101,7 +101,7 @@ TEST(DriverOneway, IsAcceptedByAProcessWithoutAPool) {
     Process other = Process::start("appends_to_kept");
     EXPECT_EQ(other.wait(), 0);
     start_pool();
-    EXPECT_TRUE(eventually([&] {
+    EXPECT_TRUE(comes_true([&] {
         Parcel reply;
         return own->transact(TestService::kAppended, Parcel(), &reply) == OK && reply.readInt32() == 1;
     })) << "it runs as soon as there is a pool";
@@ -134,7 +134,7 @@ TEST(DriverOneway, IsRefusedWhenTooMuchWaits) {
     Process other = Process::start("appends_once");
     EXPECT_EQ(other.wait(), 0) << "others have room of their own";
     gate.open();
-    EXPECT_TRUE(eventually([&] { return appended(service).size() == 6; }));
+    EXPECT_TRUE(comes_true([&] { return appended(service).size() == 6; }));
     EXPECT_EQ(append(service, 1), OK);
 }
 
@@ -157,7 +157,7 @@ TEST(DriverOneway, OfAClientThatDiesIsStillRun) {
     EXPECT_EQ(Process::start("appends_once").wait(), 0);
     std::this_thread::sleep_for(std::chrono::milliseconds(50));
     gate.open();
-    EXPECT_TRUE(eventually([&] { return appended(service).size() == 1; }));
+    EXPECT_TRUE(comes_true([&] { return appended(service).size() == 1; }));
 }
 
 TEST(DriverOneway, MayEndItsThread) {
@@ -171,7 +171,7 @@ TEST(DriverOneway, MayEndItsThread) {
         ASSERT_EQ(append(service, n), OK);
     }
     gate.open();
-    EXPECT_TRUE(eventually([&] { return appended(service).size() == 5; })) << "others run those behind it";
+    EXPECT_TRUE(comes_true([&] { return appended(service).size() == 5; })) << "others run those behind it";
 }
 
 TEST(DriverOneway, ReturnsWhatItBroughtAlong) {
@@ -188,8 +188,8 @@ TEST(DriverOneway, ReturnsWhatItBroughtAlong) {
         data.writeFileDescriptor(STDIN_FILENO);
         ASSERT_EQ(service->transact(TestService::kAppend, data, nullptr, IBinder::FLAG_ONEWAY), OK);
     }
-    EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
-    EXPECT_TRUE(eventually([&] { return count_descriptors(server.pid()) <= before; }));
+    EXPECT_TRUE(comes_true([] { return TestService::count() == 0; }));
+    EXPECT_TRUE(comes_true([&] { return count_descriptors(server.pid()) <= before; }));
 }
 
 }  // namespace

@@ -241,15 +241,6 @@ sp<IBinder> ask_for_object(const sp<IBinder>& service, uint32_t code) {
     return reply.readStrongBinder();
 }
 
-bool eventually(const std::function<bool()>& condition) {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
-    while (!condition()) {
-        if (std::chrono::steady_clock::now() > end) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(2));
-    }
-    return true;
-}
-
 size_t count_threads_named(pid_t pid, const std::string& start) {
     const std::string path = "/proc/" + std::to_string(pid) + "/task";
     const std::unique_ptr<DIR, int (*)(DIR*)> tasks(opendir(path.c_str()), closedir);

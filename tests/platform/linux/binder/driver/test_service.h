@@ -15,6 +15,7 @@
 #include <string>
 #include <vector>
 
+#include "support/eventually.h"
 #include "support/pace.h"
 #include "support/process.h"
 
@@ -113,9 +114,6 @@ int32_t ask(const android::sp<android::IBinder>& service, uint32_t code);
 int32_t ask(const android::sp<android::IBinder>& service, uint32_t code, const android::Parcel& data);
 int32_t ask(const android::sp<android::IBinder>& service, uint32_t code, const android::sp<android::IBinder>& object);
 android::sp<android::IBinder> ask_for_object(const android::sp<android::IBinder>& service, uint32_t code);
-
-// Whether a condition comes true, in ten seconds at most.
-bool eventually(const std::function<bool()>& condition);
 
 // How many threads of a process have a name that starts like this.
 size_t count_threads_named(pid_t pid, const std::string& start);

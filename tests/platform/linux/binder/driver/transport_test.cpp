@@ -64,7 +64,7 @@ TEST_F(DriverTransport, ClosesDescriptorsWithTheParcel) {
         EXPECT_EQ(count_descriptors(), here + 2);
     }
     EXPECT_EQ(count_descriptors(), here);
-    EXPECT_TRUE(eventually([&] { return count_descriptors(server_.pid()) == there; }));
+    EXPECT_TRUE(comes_true([&] { return count_descriptors(server_.pid()) == there; }));
 }
 
 TEST_F(DriverTransport, PassesDescriptorsWithParcelsOfAnySize) {
@@ -109,7 +109,7 @@ TEST_F(DriverTransport, GivesBackTheObjectsOfRefusedParcels) {
             EXPECT_EQ(echo(data, &reply), FAILED_TRANSACTION);
         }
     }
-    EXPECT_TRUE(eventually([] { return TestService::count() == 0; }));
+    EXPECT_TRUE(comes_true([] { return TestService::count() == 0; }));
 }
 
 TEST_F(DriverTransport, CarriesUpToALimitEitherWay) {

@@ -56,7 +56,7 @@ bool is_running(pid_t pid) {
 }
 
 TEST_F(KernelMachine, HasOneServiceManagerAtATime) {
-    ASSERT_TRUE(eventually([] { return defaultServiceManager()->addService(String16("own"), new TestService) == OK; }));
+    ASSERT_TRUE(comes_true([] { return defaultServiceManager()->addService(String16("own"), new TestService) == OK; }));
     FILE* other = popen((kProgram + " 2>&1").c_str(), "r");
     std::string said;
     char text[256];
@@ -71,7 +71,7 @@ TEST_F(KernelMachine, TakesAnotherServiceManagerForTheFirst) {
     const std::vector<pid_t> first = service_managers();
     ASSERT_EQ(first.size(), 1U);
     kill(first[0], SIGTERM);
-    ASSERT_TRUE(eventually([&] { return !is_running(first[0]); })) << "at the first asking";
+    ASSERT_TRUE(comes_true([&] { return !is_running(first[0]); })) << "at the first asking";
     EXPECT_EQ(find_service("own"), nullptr);
     EXPECT_EQ(defaultServiceManager()->addService(String16("own"), new TestService), DEAD_OBJECT);
 

@@ -77,7 +77,7 @@ TEST(SocketProcess, WithoutDescriptorsTurnsNewcomersAwayAndServesTheOthers) {
     std::thread caller([&] {
         while (!over) EXPECT_EQ(service->pingBinder(), OK);
     });
-    EXPECT_TRUE(eventually([&] { return service->pingBinder() == OK; }));
+    EXPECT_TRUE(comes_true([&] { return service->pingBinder() == OK; }));
     for (int i = 0; i < 3; ++i) {
         server.write_line("x");
         ASSERT_EQ(server.read_line(), "exhausted");
@@ -100,7 +100,7 @@ TEST(SocketProcess, WithoutDescriptorsTurnsNewcomersAwayAndServesTheOthers) {
         server.write_line("x");
         ASSERT_EQ(server.read_line(), "ready");
         EXPECT_EQ(service->transact(TestService::kEcho, data, &reply), OK);
-        EXPECT_TRUE(eventually([] { return Process::start("late_client").wait() == 0; })) << "all is well again";
+        EXPECT_TRUE(comes_true([] { return Process::start("late_client").wait() == 0; })) << "all is well again";
     }
     over = true;
     caller.join();

@@ -22,7 +22,7 @@ TEST(SocketObject, GoesAwayWithThePoollessProcessesNextCall) {
     const sp<IBinder> service = find_service();
     ASSERT_EQ(ask(service, TestService::kKeep, new TestService), 0);
     ASSERT_EQ(ask(service, TestService::kKeep, nullptr), 0);
-    EXPECT_TRUE(eventually([&] { return service->pingBinder() == OK && TestService::count() == 0; }));
+    EXPECT_TRUE(comes_true([&] { return service->pingBinder() == OK && TestService::count() == 0; }));
 }
 
 TEST(SocketOneway, OfAnySizeIsAcceptedAlone) {
@@ -31,7 +31,7 @@ TEST(SocketOneway, OfAnySizeIsAcceptedAlone) {
     Parcel data;
     data.setDataSize(1024 * 1024);
     EXPECT_EQ(service->transact(TestService::kAppend, data, nullptr, IBinder::FLAG_ONEWAY), OK);
-    EXPECT_TRUE(eventually([&] { return ask(service, TestService::kAppended) == 1; }));
+    EXPECT_TRUE(comes_true([&] { return ask(service, TestService::kAppended) == 1; }));
 }
 
 TEST(SocketTransport, PassesAsManyDescriptorsAsSockets) {

@@ -30,13 +30,13 @@ protected:
         over_ = true;
         caller_.join();
         // Some are kept for later.
-        EXPECT_TRUE(eventually([&] { return count_descriptors(server_.pid()) <= descriptors_ + 4; }))
+        EXPECT_TRUE(comes_true([&] { return count_descriptors(server_.pid()) <= descriptors_ + 4; }))
             << count_descriptors(server_.pid()) << " descriptors, " << descriptors_ << " before";
     }
 
     void expect_served() {
         const int calls = calls_;
-        EXPECT_TRUE(eventually([&] { return calls_ > calls + 10; })) << "the well-behaved client is still served";
+        EXPECT_TRUE(comes_true([&] { return calls_ > calls + 10; })) << "the well-behaved client is still served";
     }
 
     Process server_ = start_server();

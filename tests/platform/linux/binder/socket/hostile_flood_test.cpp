@@ -51,7 +51,7 @@ TEST_F(SocketHostileFlood, OpensThousandsOfChannels) {
     });
     std::vector<UniqueFd> channels;
     for (int i = 0; i < 3000; ++i) channels.push_back(peer.open_channel());
-    EXPECT_TRUE(eventually([&] { return refused > 1500; })) << refused;
+    EXPECT_TRUE(comes_true([&] { return refused > 1500; })) << refused;
     EXPECT_LT(count_descriptors(server_.pid()), 1200U);
     expect_served();
     shutdown(peer.control(), SHUT_RDWR);
@@ -119,7 +119,7 @@ TEST_F(SocketHostileFlood, DoesNotTakeItsReplies) {
     for (const UniqueFd& channel : channels) {
         wire::FrameHeader header{};
         EXPECT_TRUE(
-            eventually([&] { return recv(channel.get(), &header, sizeof header, MSG_PEEK | MSG_DONTWAIT) > 0; }));
+            comes_true([&] { return recv(channel.get(), &header, sizeof header, MSG_PEEK | MSG_DONTWAIT) > 0; }));
     }
     expect_served();
     EXPECT_LE(count_threads_named(server_.pid(), "Binder_"), 18U);

@@ -151,7 +151,7 @@ TEST(SocketHostileServer, LeavesNoDescriptorBehind) {
         frame.add(WireObject{77}, 0);
         EXPECT_EQ(outcome(answer_with(frame.bytes(), frame.descriptors)), DEAD_OBJECT);
     }
-    EXPECT_TRUE(eventually([&] { return count_descriptors() <= before; })) << count_descriptors() - before << " more";
+    EXPECT_TRUE(comes_true([&] { return count_descriptors() <= before; })) << count_descriptors() - before << " more";
 }
 
 TEST(SocketHostileServer, CallsWhatItWasNotGiven) {
