@@ -1,0 +1,55 @@
+// The coordinator's side of the queues: opens them, has everybody leave those that a killed client had to do with, and
+// accounts for every message of theirs.
+#pragma once
+
+#include <chrono>
+
+#include "soak/drain.h"
+#include "tavo_osal/status.h"
+
+namespace tavo::soak {
+
+using Clock = std::chrono::steady_clock;
+
+class Channels {
+public:
+    explicit Channels(Board& board);
+
+    // Opens what is closed and whose clients are there.
+    void open_for(const bool (&is_there)[kClients]);
+    // What the client, which has been reaped, had to do with.
+    void account_for_death(unsigned slot);
+    // Whether a new incarnation may come: its queues are accounted for.
+    bool are_closed_for(unsigned slot) const;
+    bool are_some_retired() const;
+    // Some steps further, without waiting for anybody.
+    void go_on();
+    // Everybody has left in good order.
+    void close_all();
+    bool knows_key(int32_t key) const;
+
+private:
+    struct Local {
+        TAVO_INT64 handle = 0;
+        int pipe = -1;
+        Drain drain;
+        bool receiver_is_dead = false, is_woken = false;
+        bool is_drained_here = false;  // nobody else receives any more
+        Clock::time_point retired;
+        int most_uses_left = 0;  // by those who were killed
+    };
+    bool open(unsigned channel);
+    void retire(unsigned channel);
+    void empty(unsigned channel);
+    void wake_receiver(unsigned channel);
+    bool have_all_left(unsigned channel) const;
+    void close(unsigned channel);
+    void close_link(unsigned channel, unsigned slot, Link& link);
+    void free_links_of_the_dead(unsigned channel);
+
+    Board& board_;
+    Local local_[kChannels];
+    uint32_t serial_ = 0;
+};
+
+}  // namespace tavo::soak

@@ -1,0 +1,36 @@
+// What the processes hold over time, and whether that stays flat.
+#pragma once
+
+#include <fstream>
+#include <string>
+#include <vector>
+
+#include "soak/processes.h"
+
+namespace tavo::soak {
+
+struct Sample {
+    double seconds;
+    Holdings holdings;
+};
+
+struct Verdict {
+    std::string process, what;
+    long second_quarter = 0, last_quarter = 0, most = 0;
+    bool is_judged = false, is_flat = true;
+};
+
+// One process that stays.
+class Series {
+public:
+    explicit Series(std::string process) : process_(std::move(process)) {}
+    void add(const Sample& sample) { samples_.push_back(sample); }
+    // Resident memory is only judged in a run of at least a minute, and not where a sanitizer keeps what was freed.
+    std::vector<Verdict> judge(bool judge_memory) const;
+
+private:
+    std::string process_;
+    std::vector<Sample> samples_;
+};
+
+}  // namespace tavo::soak
