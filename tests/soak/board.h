@@ -18,7 +18,12 @@ constexpr unsigned kLinksOfASender = 16;
 constexpr unsigned kGuards = 6;
 constexpr unsigned kMostOperations = 64;
 
-enum class LinkState : uint32_t { kFree, kUsed, kDead /* its sender was killed */ };
+enum class LinkState : uint32_t {
+    kFree,
+    kUsed,
+    kDead,  // its sender was killed
+    kOver   // and all that came of it has come, since the sender's next incarnation was heard of
+};
 
 // What one incarnation of a client sends to one channel.
 struct Link {

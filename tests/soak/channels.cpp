@@ -75,7 +75,8 @@ void Channels::account_for_death(unsigned slot) {
         }
         const bool sends = is_stream(channel) && sender_of(channel) == slot, receives = receiver_of(channel) == slot;
         local.receiver_is_dead |= receives;
-        if (receives && had_nothing_in_hand) local.drain.take_allowance();
+        local.had_nothing_in_hand |= receives && had_nothing_in_hand;
+        if (local.had_nothing_in_hand) local.drain.take_allowance();
         if (sends || receives) retire(channel);
     }
 }
@@ -115,7 +116,7 @@ void Channels::empty(unsigned channel) {
     if (!local.receiver_is_dead && !local.is_woken && !local.is_drained_here) {
         // Who has not come yet does not come any more. It had nothing in hand.
         if (board_.slots[receiver_of(channel)].receives_from[channel] != 0) return wake_receiver(channel);
-        local.is_drained_here = true;
+        local.is_drained_here = local.had_nothing_in_hand = true;
         local.drain.take_allowance();
     }
     local.is_drained_here |= local.receiver_is_dead;
@@ -124,10 +125,12 @@ void Channels::empty(unsigned channel) {
 }
 
 // A message that may not have been sent at all keeps its link until the client's next incarnation is heard of.
-void Channels::free_links_of_the_dead(unsigned channel) {
-    for (auto& links : board_.channels[channel].links) {
-        for (Link& link : links) {
-            if (link.state == LinkState::kDead && link.received == link.intent) link.state = LinkState::kFree;
+void Channels::close_links_of_the_dead(unsigned channel) {
+    for (unsigned slot = 0; slot < kClients; ++slot) {
+        for (Link& link : board_.channels[channel].links[slot]) {
+            const LinkState state = link.state;
+            const bool all_came = state == LinkState::kDead && link.received == link.intent;
+            if (all_came || state == LinkState::kOver) close_link(channel, slot, link);
         }
     }
 }
@@ -136,7 +139,7 @@ void Channels::go_on() {
     set_operation("accounting for queues");
     for (unsigned channel = 0; channel < kChannels; ++channel) {
         const ChannelState state = board_.channels[channel].state;
-        if (state == ChannelState::kOpen && !is_stream(channel)) free_links_of_the_dead(channel);
+        if (state == ChannelState::kOpen && !is_stream(channel)) close_links_of_the_dead(channel);
         if (state != ChannelState::kRetired) continue;
         empty(channel);
         if (have_all_left(channel)) close(channel);
@@ -146,7 +149,7 @@ void Channels::go_on() {
 void Channels::close_link(unsigned channel, unsigned slot, Link& link) {
     if (link.state == LinkState::kFree) return;
     const uint64_t received = link.received, done = link.done, intent = link.intent;
-    const bool is_dead = link.state == LinkState::kDead;
+    const bool is_dead = link.state != LinkState::kUsed;
     Local& local = local_[channel];
     // The message that a sender was killed in may be missing, or torn. The message that a receiver had in hand is gone.
     const bool is_right = received == intent || (is_dead && received == done) ||
@@ -159,6 +162,9 @@ void Channels::close_link(unsigned channel, unsigned slot, Link& link) {
     }
     if (link.torn && (!is_dead || intent != done + 1 || received != done)) {
         fail("a message in " + text_of(channel) + " was torn, and nobody was killed in it");
+    }
+    if (intent != done) {
+        ++(received == intent ? costs_.in_doubt_and_came : link.torn ? costs_.torn : costs_.in_doubt_and_missing);
     }
     link.state = LinkState::kFree;
 }
@@ -182,6 +188,7 @@ void Channels::close(unsigned channel) {
     for (unsigned slot = 0; slot < kClients; ++slot) {
         for (Link& link : shared.links[slot]) close_link(channel, slot, link);
     }
+    if (!local.had_nothing_in_hand && local.receiver_is_dead && !local.drain.take_allowance()) ++costs_.in_hand;
     succeeds(tavo_msg_queue_destroy(local.handle), "tavo_msg_queue_destroy");
     ::close(local.pipe);
     int left = 0;

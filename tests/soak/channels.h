@@ -11,9 +11,15 @@ namespace tavo::soak {
 
 using Clock = std::chrono::steady_clock;
 
+// What became of the messages that somebody was killed in.
+struct KillCosts {
+    unsigned in_doubt_and_came = 0, in_doubt_and_missing = 0, torn = 0, in_hand = 0;
+};
+
 class Channels {
 public:
     explicit Channels(Board& board);
+    const KillCosts& costs() const { return costs_; }
 
     // Opens what is closed and whose clients are there.
     void open_for(const bool (&is_there)[kClients]);
@@ -34,7 +40,8 @@ private:
         int pipe = -1;
         Drain drain;
         bool receiver_is_dead = false, is_woken = false;
-        bool is_drained_here = false;  // nobody else receives any more
+        bool had_nothing_in_hand = false;  // the receiver that died
+        bool is_drained_here = false;      // nobody else receives any more
         Clock::time_point retired;
         int most_uses_left = 0;  // by those who were killed
     };
@@ -45,11 +52,12 @@ private:
     bool have_all_left(unsigned channel) const;
     void close(unsigned channel);
     void close_link(unsigned channel, unsigned slot, Link& link);
-    void free_links_of_the_dead(unsigned channel);
+    void close_links_of_the_dead(unsigned channel);
 
     Board& board_;
     Local local_[kChannels];
     uint32_t serial_ = 0;
+    KillCosts costs_;
 };
 
 }  // namespace tavo::soak

@@ -4,10 +4,14 @@
 #include <sys/mman.h>
 #include <unistd.h>
 
+#include <chrono>
+#include <cstdlib>
+
 #include "soak/blocks.h"
 #include "soak/failure.h"
 #include "soak/operations.h"
 #include "soak/post.h"
+#include "tavo_osal/msg_queue_key.h"
 #include "tavo_osal/thread.h"
 
 namespace tavo::soak {
@@ -40,10 +44,21 @@ unsigned some_operation(Random& random) {
     return which;
 }
 
+// Fast enough to be seen in seconds, slow enough for there to be descriptors left for seconds.
+void leak_descriptor() {
+    static auto next = std::chrono::steady_clock::now();
+    if (std::chrono::steady_clock::now() < next) return;
+    next += std::chrono::milliseconds(15);
+    [[maybe_unused]] const int leaked = dup(kFailureFd);
+}
+
 // What a client does wrong on purpose, apart from what operations do.
 void break_something(const Client& client) {
-    if (client.breaks("leak-descriptor")) [[maybe_unused]]
-        const int leaked = dup(kFailureFd);
+    if (client.breaks("leak-descriptor")) leak_descriptor();
+    if (client.breaks("leave-use")) {
+        TAVO_INT64 queue = 0;
+        tavo_msg_queue_init(static_cast<int>(own_key(client.number, client.incarnation, 0)), &queue);
+    }
     if (client.breaks("hang")) {
         while (!client.is_leaving()) tavo_osal_thread_sleep(1);
     }
@@ -56,7 +71,7 @@ void run_until_told(Client& client) {
         client.blocks.leave_where_told(client);
         run_operation(client, some_operation(client.random));
         if (client.random.one_in(16)) tavo_osal_thread_usleep(client.random.below(kRestMostUs));
-        if (!client.fault.empty() && client.random.one_in(50)) break_something(client);
+        if (!client.fault.empty()) break_something(client);
     }
 }
 

@@ -193,12 +193,32 @@ void Coordinator::reap() {
     }
 }
 
+// Most moments are in no step that a kill could tear: half of the kills wait a little for one.
+void Coordinator::await_step(const Slot& slot, unsigned number) const {
+    const auto is_in_one = [&] {
+        for (unsigned i = 0; i < kGuards; ++i) {
+            if (slot.at_guard[i]) return true;
+        }
+        for (const Channel& channel : board_->channels) {
+            for (const Link& link : channel.links[number]) {
+                if (link.state == LinkState::kUsed && link.intent != link.done) return true;
+            }
+        }
+        return false;
+    };
+    const auto deadline = Clock::now() + kStep;
+    while (!is_in_one() && Clock::now() < deadline) {
+    }
+}
+
 void Coordinator::kill_one() {
     if (Clock::now() < next_kill_) return;
     next_kill_ = Clock::now() + milliseconds(random_.between(100, 1500));
-    ClientProcess& client = clients_[random_.between(kSteadyClients, kClients - 1)];
+    const unsigned slot = random_.between(kSteadyClients, kClients - 1);
+    ClientProcess& client = clients_[slot];
     if (!client.process.is_running() || client.was_killed) return;
     client.was_killed = true;
+    if (random_.one_in(2)) await_step(board_->slots[slot], slot);
     client.process.kill(SIGKILL);
     ++kills_;
 }
@@ -357,9 +377,9 @@ void Coordinator::end_in_order() {
 }
 
 void Coordinator::judge() {
-    const bool judge_memory = seconds() >= 60 && !is_sanitized();
+    const bool is_long = seconds() >= 60;
     for (const Series& series : series_) {
-        const std::vector<Verdict> verdicts = series.judge(judge_memory);
+        const std::vector<Verdict> verdicts = series.judge(is_long, is_long && !is_sanitized());
         verdicts_.insert(verdicts_.end(), verdicts.begin(), verdicts.end());
     }
     for (const Verdict& v : verdicts_) {

@@ -162,7 +162,7 @@ bool Drain::is_left_by_kills() {
     uint32_t number = 0;
     const Link* link = link_of_stream(number);
     if (link == nullptr) return false;
-    const bool sender_was_in = link->state == LinkState::kDead && link->intent == link->done + 1;
+    const bool sender_was_in = link->state != LinkState::kUsed && link->intent == link->done + 1;
     const uint64_t torn = sender_was_in ? link->done + 1 : 0;
     const uint64_t next = link->received + 1;
     if (is_in_step_) return torn == next && begins_with(bytes_, 0, next_of_stream(0));

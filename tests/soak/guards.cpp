@@ -85,6 +85,8 @@ void Guards::close(unsigned which) {
     const bool may_be_half_written = local.a_client_died && guard.intent == guard.done + 1;
     if (!may_be_half_written && !block_is_right(guard, local.bytes, wrong)) fail(wrong);
     if (guard.intent != guard.done && !may_be_half_written) fail("a block was left while it was written");
+    given_up_ += local.a_client_died ? 1 : 0;
+    half_written_ += may_be_half_written ? 1 : 0;
     succeeds(tavo_shm_release(local.bytes), "tavo_shm_release");
     succeeds(tavo_shm_delete(local.handle), "tavo_shm_delete");
     succeeds(tavo_semaphore_delete(local.semaphore), "tavo_semaphore_delete");

@@ -19,6 +19,8 @@ public:
     void change_one();
     void close_all();
     bool knows_key(uint32_t key) const;
+    unsigned given_up() const { return given_up_; }
+    unsigned half_written() const { return half_written_; }
 
 private:
     struct Local {
@@ -35,6 +37,7 @@ private:
     Random random_;
     Local local_[kGuards];
     uint32_t serial_ = 0;
+    unsigned given_up_ = 0, half_written_ = 0;  // because of kills
 };
 
 }  // namespace tavo::soak

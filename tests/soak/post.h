@@ -72,7 +72,7 @@ private:
     bool receive();
     bool take(const Header& header);
     bool take_torn(size_t size);
-    void close_links_before(unsigned slot, const Link& link);
+    void end_links_before(unsigned slot, const Link& link);
 
     Board& board_;
     Slot& slot_;

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <utility>
 
 #include "soak/coordinator.h"
 #include "soak/operations.h"
@@ -52,6 +53,17 @@ std::string Report::page() const {
         text += formatted("| %s | %s | %ld | %ld | %ld | %s |\n", v.process.c_str(), v.what.c_str(), v.second_quarter,
                           v.last_quarter, v.most, word_for(v));
     }
+    const KillCosts& costs = run_.channels_->costs();
+    text += "\n## What the kills cost\n\n| what | times |\n|---|---|\n";
+    const std::pair<const char*, unsigned> rows[] = {
+        {"a sender was killed in a put, and the message came", costs.in_doubt_and_came},
+        {"a sender was killed in a put, and the message did not come", costs.in_doubt_and_missing},
+        {"a sender was killed in a put, and a part of the message came", costs.torn},
+        {"a receiver was killed with a message in hand, which is gone", costs.in_hand},
+        {"a client was killed in a semaphore's turn, or waiting for it", run_.guards_->given_up()},
+        {"of these: inside a write to the block", run_.guards_->half_written()},
+    };
+    for (const auto& [what, times] : rows) text += formatted("| %s | %u |\n", what, times);
     text += "\n## Operations\n\n| operation | times |\n|---|---|\n";
     for (unsigned i = 0; i < kOperationCount; ++i) {
         uint64_t count = 0;

@@ -21,6 +21,7 @@ constexpr Measure kMeasures[] = {
     {"mappings", &Holdings::mappings, 24},
 };
 constexpr long kSlackDivisor = 10;
+constexpr long kSlackOfShortRuns = 6;
 
 long median(const std::vector<Sample>& samples, size_t from, size_t to, long Holdings::*value) {
     std::vector<long> values;
@@ -31,7 +32,7 @@ long median(const std::vector<Sample>& samples, size_t from, size_t to, long Hol
 
 }  // namespace
 
-std::vector<Verdict> Series::judge(bool judge_memory) const {
+std::vector<Verdict> Series::judge(bool is_long, bool judge_memory) const {
     std::vector<Verdict> verdicts;
     const size_t count = samples_.size();
     for (const Measure& measure : kMeasures) {
@@ -42,7 +43,8 @@ std::vector<Verdict> Series::judge(bool judge_memory) const {
         if (count >= kLeastSamples) {
             verdict.second_quarter = median(samples_, count / 4, count / 2, measure.value);
             verdict.last_quarter = median(samples_, count - count / 4, count, measure.value);
-            const long limit = verdict.second_quarter + verdict.second_quarter / kSlackDivisor + measure.slack;
+            const long limit = verdict.second_quarter + verdict.second_quarter / kSlackDivisor +
+                               measure.slack * (is_long ? 1 : kSlackOfShortRuns);
             verdict.is_judged = judge_memory || measure.value != &Holdings::resident_kib;
             verdict.is_flat = !verdict.is_judged || verdict.last_quarter <= limit;
         }

@@ -25,8 +25,9 @@ class Series {
 public:
     explicit Series(std::string process) : process_(std::move(process)) {}
     void add(const Sample& sample) { samples_.push_back(sample); }
-    // Resident memory is only judged in a run of at least a minute, and not where a sanitizer keeps what was freed.
-    std::vector<Verdict> judge(bool judge_memory) const;
+    // The quarters of a short run differ by what happens in them, and it is not told by its memory. Nor is one with a
+    // sanitizer, which keeps what was freed.
+    std::vector<Verdict> judge(bool is_long, bool judge_memory) const;
 
 private:
     std::string process_;
