@@ -17,7 +17,7 @@ void write_block(Client& client, const Guard& guard, unsigned char* bytes, uint6
     const BlockHeader header = {generation, client.number, client.incarnation, client.random.next()};
     tavo_osal_memcpy(bytes, &header, sizeof header);
     fill(header.seed, bytes + sizeof header, guard.size - sizeof header);
-    if (client.breaks("damage-block") && generation % 5 == 0) bytes[guard.size - 1] ^= 1;
+    if (client.breaks("damage-block") && generation % 3 == 0) bytes[guard.size - 1] ^= 1;
 }
 
 }  // namespace

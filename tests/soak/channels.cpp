@@ -29,7 +29,7 @@ bool is_empty(int pipe) {
 
 }  // namespace
 
-Channels::Channels(Board& board) : board_(board) {}
+Channels::Channels(Board& board, const std::string& fault) : board_(board), fault_(fault) {}
 
 bool Channels::open(unsigned channel) {
     Channel& shared = board_.channels[channel];
@@ -38,7 +38,7 @@ bool Channels::open(unsigned channel) {
     if (!succeeds(tavo_msg_queue_init(channel_key(serial), &local.handle), "tavo_msg_queue_init")) return false;
     local.pipe = read_end_of(channel_key(serial));
     if (!expect(local.pipe >= 0, "the service has no descriptor for a new queue")) return false;
-    local.drain = Drain(shared, channel, local.pipe);
+    local.drain = Drain(shared, channel, local.pipe, fault_ == "lose-left");
     local_[channel] = local;
     for (auto& links : shared.links) {
         for (Link& link : links) link.state = LinkState::kFree;

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <chrono>
+#include <string>
 
 #include "soak/drain.h"
 #include "tavo_osal/status.h"
@@ -18,7 +19,7 @@ struct KillCosts {
 
 class Channels {
 public:
-    explicit Channels(Board& board);
+    Channels(Board& board, const std::string& fault);
     const KillCosts& costs() const { return costs_; }
 
     // Opens what is closed and whose clients are there.
@@ -55,6 +56,7 @@ private:
     void close_links_of_the_dead(unsigned channel);
 
     Board& board_;
+    const std::string fault_;
     Local local_[kChannels];
     uint32_t serial_ = 0;
     KillCosts costs_;

@@ -55,9 +55,9 @@ void leak_descriptor() {
 // What a client does wrong on purpose, apart from what operations do.
 void break_something(const Client& client) {
     if (client.breaks("leak-descriptor")) leak_descriptor();
-    if (client.breaks("leave-use")) {
-        TAVO_INT64 queue = 0;
-        tavo_msg_queue_init(static_cast<int>(own_key(client.number, client.incarnation, 0)), &queue);
+    static TAVO_INT64 left = 0;
+    if (client.breaks("leave-use") && left == 0) {
+        tavo_msg_queue_init(static_cast<int>(own_key(client.number, client.incarnation, 0)), &left);
     }
     if (client.breaks("hang")) {
         while (!client.is_leaving()) tavo_osal_thread_sleep(1);

@@ -405,13 +405,14 @@ int Coordinator::run() {
     printf("seed %llu\n", static_cast<unsigned long long>(options_.seed));
     fflush(stdout);
     std::ofstream(TAVO_STORAGE_ROOT "/shm_key_gen_file.txt") << "soak\n";
-    channels_ = std::make_unique<Channels>(*board_);
+    channels_ = std::make_unique<Channels>(*board_, options_.fault);
     guards_ = std::make_unique<Guards>(*board_, options_.seed);
     series_.emplace_back("server");
     for (unsigned i = 0; i < kSteadyClients; ++i) series_.emplace_back("client " + std::to_string(i));
     if (start_server()) {
         next_progress_ = Clock::now();
-        run_until([] { return g_stop != 0; }, start_ + duration);
+        run_until([this] { return g_stop != 0 || (options_.stop_at_failure && failure_count_ > 0); },
+                  start_ + duration);
         judge();
         end_in_order();
         reap();

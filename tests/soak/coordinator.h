@@ -23,6 +23,7 @@ struct Options {
     std::string output = "build/soak";
     unsigned patience = 60;  // seconds without progress of a client
     unsigned grace = 12;     // seconds for everybody to leave in the end
+    bool stop_at_failure = false;
     std::string fault;
 };
 

@@ -129,7 +129,7 @@ bool Drain::take_message(size_t at, size_t& end) {
 }
 
 void Drain::check(const Header& header, bool is_whole) {
-    if (header.kind == Kind::kRetire) return;
+    if (header.kind == Kind::kRetire || (loses_some_ && header.number % 3 == 0)) return;
     if (header.slot >= kClients || header.link >= kLinksOfASender || header.serial != channel_->serial || !is_whole) {
         fail("a damaged message, by its header " + text_of(header) + ", was left by a killed receiver");
         return;

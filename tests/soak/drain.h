@@ -10,7 +10,9 @@ namespace tavo::soak {
 class Drain {
 public:
     Drain() = default;
-    Drain(Channel& channel, unsigned number, int pipe) : channel_(&channel), number_(number), pipe_(pipe) {}
+    // `loses_some`, to show that it is noticed.
+    Drain(Channel& channel, unsigned number, int pipe, bool loses_some)
+        : channel_(&channel), number_(number), pipe_(pipe), loses_some_(loses_some) {}
 
     // Whatever there is now.
     void take();
@@ -34,6 +36,7 @@ private:
     Channel* channel_ = nullptr;
     unsigned number_ = 0;
     int pipe_ = -1;
+    bool loses_some_ = false;
     Bytes bytes_;
     bool is_in_step_ = false, is_lost_ = false, has_allowance_ = true;
 };

@@ -34,6 +34,7 @@ int main(int argc, char** argv) {
     app.add_option("--patience", options.patience, "seconds without progress that make a failure")
         ->capture_default_str();
     app.add_option("--grace", options.grace, "seconds for all to leave in the end")->capture_default_str();
+    app.add_flag("--stop-at-failure", options.stop_at_failure, "end at the first failure");
     app.add_option("--break", options.fault)->group("");
     app.add_option("--role", role)->group("");
     app.add_option("--slot", client.slot)->group("");
