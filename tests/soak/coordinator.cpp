@@ -120,7 +120,8 @@ void Coordinator::read_failures() {
 }
 
 bool Coordinator::start_server() {
-    server_ = ChildProcess({"--role", "server"}, board_fd_, failures_out_, options_.output + "/server.log");
+    server_ = ChildProcess({"--role", "server", "--break", options_.fault}, board_fd_, failures_out_,
+                           options_.output + "/server.log");
     const auto deadline = Clock::now() + std::chrono::seconds(options_.patience);
     // It is there when it answers.
     for (ServiceUses uses; Clock::now() < deadline; std::this_thread::sleep_for(kStep)) {
@@ -272,9 +273,10 @@ void Coordinator::sample() {
     const auto add = [&](const std::string& name, uint32_t incarnation, const ChildProcess& process, Series* series) {
         if (!process.is_running()) return;
         const Holdings h = process.holdings();
+        if (h.resident_kib == 0) return;  // it has just been killed
         samples_file_ << now << ',' << name << ',' << incarnation << ',' << h.descriptors << ',' << h.resident_kib
                       << ',' << h.threads << ',' << h.mappings << '\n';
-        if (series != nullptr && h.resident_kib > 0) series->add({now, h});
+        if (series != nullptr) series->add({now, h});
     };
     add("server", 1, server_, &series_[0]);
     for (unsigned i = 0; i < kClients; ++i) {
@@ -374,6 +376,11 @@ void Coordinator::end_in_order() {
         client.was_killed = true;
         client.process.kill(SIGKILL);
     }
+    if (!server_is_wanted_) return;
+    reap();
+    channels_->close_all();
+    guards_->close_all();
+    take_back_unknown_uses(true);
 }
 
 void Coordinator::judge() {
@@ -414,11 +421,8 @@ int Coordinator::run() {
         run_until([this] { return g_stop != 0 || (options_.stop_at_failure && failure_count_ > 0); },
                   start_ + duration);
         judge();
-        end_in_order();
-        reap();
-        channels_->close_all();
-        guards_->close_all();
-        if (server_is_wanted_) take_back_unknown_uses(true);
+        // Without a server nobody can give anything back.
+        if (server_is_wanted_) end_in_order();
     }
     read_failures();
     server_is_wanted_ = false;

@@ -5,7 +5,7 @@
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
-#include <chrono>
+#include <cstdlib>
 #include <random>
 
 #include "soak/client.h"
@@ -15,8 +15,12 @@
 
 namespace {
 
-int serve() {
+int serve(const std::string& fault) {
     if (tavo_osal_init(25, 25) != TAVO_SUCCESS) return 2;
+    if (fault == "crash-server") {
+        sleep(2);
+        abort();
+    }
     for (;;) pause();
 }
 
@@ -45,7 +49,7 @@ int main(int argc, char** argv) {
         tavo::soak::end_with_parent();
         // A terminal's interrupt is for the coordinator, which lets everybody leave in good order.
         signal(SIGINT, SIG_IGN);
-        if (role == "server") return serve();
+        if (role == "server") return serve(options.fault);
         client.seed = options.seed;
         client.fault = options.fault;
         return tavo::soak::run_client(client);
