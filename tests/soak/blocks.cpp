@@ -5,6 +5,7 @@
 #include "soak/operations.h"
 #include "tavo_osal/ipc_semaphore.h"
 #include "tavo_osal/memory.h"
+#include "tavo_osal/thread.h"
 
 namespace tavo::soak {
 namespace {
@@ -16,6 +17,8 @@ bool must_leave(const Guard& guard, uint32_t serial) {
 void write_block(Client& client, const Guard& guard, unsigned char* bytes, uint64_t generation) {
     const BlockHeader header = {generation, client.number, client.incarnation, client.random.next()};
     tavo_osal_memcpy(bytes, &header, sizeof header);
+    // So that a kill may come here, too.
+    if (client.random.one_in(20)) tavo_osal_thread_msleep(1);
     fill(header.seed, bytes + sizeof header, guard.size - sizeof header);
     if (client.breaks("damage-block") && generation % 3 == 0) bytes[guard.size - 1] ^= 1;
 }

@@ -23,7 +23,7 @@ namespace {
 
 using std::chrono::milliseconds;
 
-constexpr milliseconds kStep(10);
+constexpr milliseconds kStep(10), kMostAim(30);
 constexpr size_t kMostFailuresShown = 100;
 constexpr int kReportSeconds = 3;
 
@@ -194,20 +194,25 @@ void Coordinator::reap() {
     }
 }
 
-// Most moments are in no step that a kill could tear: half of the kills wait a little for one.
-void Coordinator::await_step(const Slot& slot, unsigned number) const {
-    const auto is_in_one = [&] {
-        for (unsigned i = 0; i < kGuards; ++i) {
-            if (slot.at_guard[i]) return true;
-        }
-        for (const Channel& channel : board_->channels) {
-            for (const Link& link : channel.links[number]) {
-                if (link.state == LinkState::kUsed && link.intent != link.done) return true;
-            }
-        }
-        return false;
+// Most moments are in no step that a kill could tear: half of the kills wait a little for one of some kind.
+void Coordinator::await_step(unsigned slot) {
+    const Slot& victim = board_->slots[slot];
+    const auto is_putting = [&](const Channel& channel) {
+        const auto& links = channel.links[slot];
+        return std::any_of(links, links + kLinksOfASender,
+                           [](const Link& link) { return link.state == LinkState::kUsed && link.intent != link.done; });
     };
-    const auto deadline = Clock::now() + kStep;
+    const auto is_writing = [&](unsigned guard) {
+        return victim.at_guard[guard] && board_->guards[guard].intent != board_->guards[guard].done;
+    };
+    const unsigned kind = random_.below(4);
+    const auto is_in_one = [&] {
+        if (kind == 0) return is_putting(board_->channels[random_.below(kInboxes)]);
+        if (kind == 1) return is_putting(board_->channels[stream_of(slot)]);
+        const unsigned guard = random_.below(kGuards);
+        return kind == 2 ? is_writing(guard) : victim.at_guard[guard].load();
+    };
+    const auto deadline = Clock::now() + kMostAim;
     while (!is_in_one() && Clock::now() < deadline) {
     }
 }
@@ -219,7 +224,7 @@ void Coordinator::kill_one() {
     ClientProcess& client = clients_[slot];
     if (!client.process.is_running() || client.was_killed) return;
     client.was_killed = true;
-    if (random_.one_in(2)) await_step(board_->slots[slot], slot);
+    if (random_.one_in(2)) await_step(slot);
     client.process.kill(SIGKILL);
     ++kills_;
 }
@@ -301,10 +306,9 @@ void Coordinator::show_progress(bool is_due) {
     if (!is_due && Clock::now() < next_progress_) return;
     next_progress_ = Clock::now() + (on_terminal ? milliseconds(500) : milliseconds(30000));
     const Totals all = totals();
-    fprintf(stderr, "%s%6.0f of %.0f s: %llu messages (%.0f a second), %llu operations, %u kills, %zu failures%s",
+    fprintf(stderr, "%s%.0f of %.0f s: %llu messages, %.0f a second; %u kills, %zu failures%s",
             on_terminal ? "\r\033[K" : "", seconds(), options_.minutes * 60,
-            static_cast<unsigned long long>(all.messages), messages_per_second_,
-            static_cast<unsigned long long>(all.operations), kills_, failure_count_,
+            static_cast<unsigned long long>(all.messages), messages_per_second_, kills_, failure_count_,
             on_terminal && !is_due ? "" : "\n");
 }
 

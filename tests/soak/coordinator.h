@@ -51,7 +51,7 @@ private:
     void restart_the_dead();
     void reap();
     void clean_up_after(unsigned slot);
-    void await_step(const Slot& slot, unsigned number) const;
+    void await_step(unsigned slot);
     void kill_one();
     void watch_progress();
     void take_back_unknown_uses(bool is_the_end);

@@ -158,6 +158,8 @@ void Receiver::serve() {
 }
 
 bool Receiver::receive() {
+    // A queue that is always empty shows nobody waiting for room, nor killed while waiting.
+    if (random_.one_in(is_stream(number_) ? 100 : 5000)) tavo_osal_thread_msleep(random_.below(100));
     unsigned size = 0;
     const TAVO_Status status = random_.one_in(3)
                                    ? tavo_msg_queue_receivemessage(attachment_.handle(), &size, buffer_.data())
