@@ -7,14 +7,11 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <atomic>
-#include <cerrno>
 #include <cstdio>
-#include <cstring>
+#include <fstream>
 #include <thread>
 
 #include "soak/failure.h"
-#include "soak/operations.h"
 #include "soak/report.h"
 #include "soak/service_uses.h"
 
@@ -23,9 +20,9 @@ namespace {
 
 using std::chrono::milliseconds;
 
-constexpr milliseconds kStep(10), kMostAim(30);
+constexpr milliseconds kStep(10);
+constexpr std::chrono::seconds kReportTime(3), kKilledStragglersTime(2);
 constexpr size_t kMostFailuresShown = 100;
-constexpr int kReportSeconds = 3;
 
 volatile sig_atomic_t g_stop = 0;
 
@@ -43,22 +40,11 @@ Board* make_board(int& fd) {
     return memory != MAP_FAILED ? static_cast<Board*>(memory) : nullptr;
 }
 
-bool is_sanitized() {
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-    return true;
-#else
-    return false;
-#endif
-}
-
-std::string text_of(unsigned slot, const Slot& shared) {
-    return "client " + std::to_string(slot) + "." + std::to_string(shared.incarnation);
-}
-
-std::string stands_at(const Slot& slot) {
-    if (slot.stage == Stage::kStarting) return "start";
-    if (slot.stage != Stage::kRunning) return "leaving";
-    return kOperations[slot.operation % kOperationCount].name;
+void stop_when_interrupted() {
+    struct sigaction action = {};
+    action.sa_handler = [](int) { g_stop = 1; };
+    sigaction(SIGINT, &action, nullptr);
+    sigaction(SIGTERM, &action, nullptr);
 }
 
 // Whatever hangs, this process included, there is an end. The children end with it.
@@ -71,39 +57,32 @@ void end_at(Clock::time_point last) {
     }).detach();
 }
 
+bool is_on_terminal() {
+    static const bool answer = isatty(STDERR_FILENO) == 1;
+    return answer;
+}
+
+// A line that the next one is written over.
+constexpr char kOverwrite[] = "\r\033[K";
+
 }  // namespace
 
 Coordinator::Coordinator(const Options& options)
     : options_(options), random_(options.seed), board_(make_board(board_fd_)) {
     int ends[2] = {-1, -1};
+    // Without waiting: somebody who cannot tell a failure because of many others is not to stand still.
     if (pipe2(ends, O_CLOEXEC | O_NONBLOCK) != 0) perror("pipe2");
     failures_in_ = moved_up(ends[0]);
     failures_out_ = moved_up(ends[1]);
     dup3(failures_out_, kFailureFd, O_CLOEXEC);
-    samples_file_.open(options.output + "/samples.csv");
-    rates_file_.open(options.output + "/rates.csv");
-    samples_file_ << "seconds,process,incarnation,descriptors,resident_kib,threads,mappings\n";
-    rates_file_ << "seconds,messages_per_second,operations_per_second,kills\n";
-}
-
-double Coordinator::seconds() const { return std::chrono::duration<double>(Clock::now() - start_).count(); }
-
-Coordinator::Totals Coordinator::totals() const {
-    Totals totals;
-    for (const Slot& slot : board_->slots) {
-        totals.messages += slot.messages;
-        totals.bytes += slot.bytes;
-        for (const auto& count : slot.done) totals.operations += count;
-    }
-    return totals;
 }
 
 void Coordinator::report_failure(const std::string& line) {
     ++failure_count_;
     if (failure_count_ > kMostFailuresShown) return;
-    const std::string text = "seed " + std::to_string(options_.seed) + ": " + line;
-    failures_.push_back(text);
-    printf("FAILURE: %s\n", text.c_str());
+    failures_.push_back("seed " + std::to_string(options_.seed) + ": " + line);
+    if (is_on_terminal()) fputs(kOverwrite, stderr);
+    printf("FAILURE: %s\n", failures_.back().c_str());
     fflush(stdout);
 }
 
@@ -122,150 +101,37 @@ void Coordinator::read_failures() {
 bool Coordinator::start_server() {
     server_ = ChildProcess({"--role", "server", "--break", options_.fault}, board_fd_, failures_out_,
                            options_.output + "/server.log");
+    const char* const marker = TAVO_STORAGE_ROOT "/com.zorla.qirserver/android.tavo.osal";
     const auto deadline = Clock::now() + std::chrono::seconds(options_.patience);
     // It is there when it answers.
     for (ServiceUses uses; Clock::now() < deadline; std::this_thread::sleep_for(kStep)) {
-        if (access(TAVO_STORAGE_ROOT "/com.zorla.qirserver/android.tavo.osal", R_OK) == 0 && read_uses(uses))
-            return true;
+        if (access(marker, R_OK) == 0 && read_uses(uses)) return server_is_there_ = true;
     }
     fail("the server does not answer");
     return false;
 }
 
-void Coordinator::start_client(unsigned slot) {
-    Slot& shared = board_->slots[slot];
-    shared.incarnation = shared.incarnation + 1;
-    shared.stage = Stage::kStarting;
-    ClientProcess& client = clients_[slot];
-    client = {};
-    client.progressed = Clock::now();
-    client.operations = shared.operations;
-    std::vector<std::string> arguments = {"--role",        "client",
-                                          "--slot",        std::to_string(slot),
-                                          "--incarnation", std::to_string(shared.incarnation),
-                                          "--seed",        std::to_string(options_.seed)};
-    if (!options_.fault.empty() && slot == 0) arguments.insert(arguments.end(), {"--break", options_.fault});
-    client.process =
-        ChildProcess(arguments, board_fd_, failures_out_, options_.output + "/client-" + std::to_string(slot) + ".log");
-}
-
-void Coordinator::restart_the_dead() {
-    bool is_there[kClients];
-    for (unsigned i = 0; i < kClients; ++i) {
-        ClientProcess& client = clients_[i];
-        if (!client.process.is_running() && Clock::now() >= client.restart && channels_->are_closed_for(i))
-            start_client(i);
-        is_there[i] = client.process.is_running();
-    }
-    channels_->open_for(is_there);
-}
-
-// Files that no operation of the killed client's is going to remove.
-void Coordinator::clean_up_after(unsigned slot) {
-    const uint32_t incarnation = board_->slots[slot].incarnation;
-    const std::string root = TAVO_STORAGE_ROOT;
-    const std::string own = root + "/soak-" + std::to_string(slot) + "." + std::to_string(incarnation) + "-";
-    for (const char* leaf : {"file", "made", "socket"}) unlink((own + leaf).c_str());
-    for (uint32_t i = 0; i < kOwnKeys; ++i) {
-        unlink((root + "/" + std::to_string(own_key(slot, incarnation, i))).c_str());
-    }
-}
-
-void Coordinator::reap() {
+void Coordinator::watch_server() {
     std::string how;
-    if (server_is_wanted_ && server_.has_ended(how)) {
-        server_is_wanted_ = false;
-        report_failure("server: " + how + ", see server.log");
-    }
-    for (unsigned i = 0; i < kClients; ++i) {
-        ClientProcess& client = clients_[i];
-        if (!client.process.has_ended(how)) continue;
-        const Slot& shared = board_->slots[i];
-        client.ended_in_order = shared.stage == Stage::kGone && how == "exit status 0";
-        if (!client.was_killed && !client.ended_in_order) {
-            report_failure(text_of(i, shared) + ", " + stands_at(shared) + ": " + how + ", see client-" +
-                           std::to_string(i) + ".log");
-        }
-        client.restart = Clock::now() + milliseconds(random_.below(300));
-        if (client.ended_in_order) continue;
-        channels_->account_for_death(i);
-        guards_->account_for_death(i);
-        clean_up_after(i);
-    }
-}
-
-// Most moments are in no step that a kill could tear: half of the kills wait a little for one of some kind.
-void Coordinator::await_step(unsigned slot) {
-    const Slot& victim = board_->slots[slot];
-    const auto is_putting = [&](const Channel& channel) {
-        const auto& links = channel.links[slot];
-        return std::any_of(links, links + kLinksOfASender,
-                           [](const Link& link) { return link.state == LinkState::kUsed && link.intent != link.done; });
-    };
-    const auto is_writing = [&](unsigned guard) {
-        return victim.at_guard[guard] && board_->guards[guard].intent != board_->guards[guard].done;
-    };
-    const unsigned kind = random_.below(4);
-    const auto is_in_one = [&] {
-        if (kind == 0) return is_putting(board_->channels[random_.below(kInboxes)]);
-        if (kind == 1) return is_putting(board_->channels[stream_of(slot)]);
-        const unsigned guard = random_.below(kGuards);
-        return kind == 2 ? is_writing(guard) : victim.at_guard[guard].load();
-    };
-    const auto deadline = Clock::now() + kMostAim;
-    while (!is_in_one() && Clock::now() < deadline) {
-    }
-}
-
-void Coordinator::kill_one() {
-    if (Clock::now() < next_kill_) return;
-    next_kill_ = Clock::now() + milliseconds(random_.between(100, 1500));
-    const unsigned slot = random_.between(kSteadyClients, kClients - 1);
-    ClientProcess& client = clients_[slot];
-    if (!client.process.is_running() || client.was_killed) return;
-    client.was_killed = true;
-    if (random_.one_in(2)) await_step(slot);
-    client.process.kill(SIGKILL);
-    ++kills_;
-}
-
-void Coordinator::watch_progress() {
-    for (unsigned i = 0; i < kClients; ++i) {
-        ClientProcess& client = clients_[i];
-        const Slot& shared = board_->slots[i];
-        if (!client.process.is_running() || client.was_killed) continue;
-        if (client.operations != shared.operations) {
-            client.operations = shared.operations;
-            client.progressed = Clock::now();
-        } else if (Clock::now() > client.progressed + std::chrono::seconds(options_.patience)) {
-            report_failure(text_of(i, shared) + " (pid " + std::to_string(client.process.pid()) + "), " +
-                           stands_at(shared) + ": no progress for " + std::to_string(options_.patience) + " s");
-            client.was_killed = true;
-            client.process.kill(SIGKILL);
-        }
-    }
+    if (!server_is_there_ || !server_.has_ended(how)) return;
+    server_is_there_ = false;
+    report_failure("server: " + how + ", see server.log");
 }
 
 // The service keeps the uses that a killed client did not give back, also one that it counted when the client was
 // dead already. Nobody uses these keys any more, so they are taken back here.
 void Coordinator::take_back_unknown_uses(bool is_the_end) {
+    set_operation("taking uses back");
     ServiceUses uses;
     if (!expect(read_uses(uses), "the service does not tell its figures")) return;
-    const auto is_known = [this](uint32_t key, const char* what) {
-        const unsigned slot = slot_of_key(key);
-        if (slot >= kClients || incarnation_of_key(key) != board_->slots[slot].incarnation) return false;
-        const ClientProcess& client = clients_[slot];
-        if (client.ended_in_order) fail(text_of(slot, board_->slots[slot]) + " ended and left a use of a " + what);
-        return client.process.is_running();
-    };
     for (const auto& [key, count] : uses.queues) {
         const auto number = static_cast<int32_t>(key);
-        if (is_known(key, "queue") || channels_->knows_key(number)) continue;
+        if (clients_->have_own_key(key, "queue") || channels_->knows_key(number)) continue;
         while (take_queue_use(number)) {
         }
     }
     for (const auto& [key, count] : uses.blocks) {
-        if (is_known(key, "block") || guards_->knows_key(key)) continue;
+        if (clients_->have_own_key(key, "block") || guards_->knows_key(key)) continue;
         for (int i = 0; i < count; ++i) take_block_use(key);
     }
     if (!is_the_end) return;
@@ -273,69 +139,40 @@ void Coordinator::take_back_unknown_uses(bool is_the_end) {
     expect(read_uses(left) && left.queues.empty() && left.blocks.empty(), "the service is not empty in the end");
 }
 
-void Coordinator::sample() {
-    const double now = seconds(), passed = now - seconds_at_last_sample_;
-    const auto add = [&](const std::string& name, uint32_t incarnation, const ChildProcess& process, Series* series) {
-        if (!process.is_running()) return;
-        const Holdings h = process.holdings();
-        if (h.resident_kib == 0) return;  // it has just been killed
-        samples_file_ << now << ',' << name << ',' << incarnation << ',' << h.descriptors << ',' << h.resident_kib
-                      << ',' << h.threads << ',' << h.mappings << '\n';
-        if (series != nullptr) series->add({now, h});
-    };
-    add("server", 1, server_, &series_[0]);
-    for (unsigned i = 0; i < kClients; ++i) {
-        add("client " + std::to_string(i), board_->slots[i].incarnation, clients_[i].process,
-            i < kSteadyClients ? &series_[1 + i] : nullptr);
-    }
-    const Totals all = totals();
-    if (passed > 0) {
-        messages_per_second_ = static_cast<double>(all.messages - at_last_sample_.messages) / passed;
-        rates_file_ << now << ',' << messages_per_second_ << ','
-                    << static_cast<double>(all.operations - at_last_sample_.operations) / passed << ',' << kills_
-                    << '\n';
-    }
-    at_last_sample_ = all;
-    seconds_at_last_sample_ = now;
-    samples_file_.flush();
-    rates_file_.flush();
-}
-
-void Coordinator::show_progress(bool is_due) {
-    static const bool on_terminal = isatty(STDERR_FILENO) == 1;
-    if (!is_due && Clock::now() < next_progress_) return;
-    next_progress_ = Clock::now() + (on_terminal ? milliseconds(500) : milliseconds(30000));
-    const Totals all = totals();
+void Coordinator::show_progress(bool is_the_end) {
+    if (!is_the_end && Clock::now() < next_progress_) return;
+    next_progress_ = Clock::now() + (is_on_terminal() ? milliseconds(500) : milliseconds(30000));
     fprintf(stderr, "%s%.0f of %.0f s: %llu messages, %.0f a second; %u kills, %zu failures%s",
-            on_terminal ? "\r\033[K" : "", seconds(), options_.minutes * 60,
-            static_cast<unsigned long long>(all.messages), messages_per_second_, kills_, failure_count_,
-            on_terminal && !is_due ? "" : "\n");
+            is_on_terminal() ? kOverwrite : "", recorder_->seconds(), options_.minutes * 60,
+            static_cast<unsigned long long>(recorder_->totals().messages), recorder_->messages_per_second(),
+            clients_->kills(), failure_count_, is_on_terminal() && !is_the_end ? "" : "\n");
 }
 
 void Coordinator::step() {
     const auto now = Clock::now();
-    reap();
+    watch_server();
+    if (!server_is_there_) return;  // whoever asks it waits for long
+    clients_->reap(*channels_, *guards_);
     channels_->go_on();
     guards_->go_on();
-    watch_progress();
-    if (kills_are_wanted_) {
-        restart_the_dead();
+    clients_->watch_progress();
+    if (is_running_) {
+        clients_->start_missing(*channels_);
         guards_->open_all();
-        kill_one();
-        if (now >= next_change_) {
-            next_change_ = now + milliseconds(random_.between(500, 4000));
-            guards_->change_one();
-        }
+        clients_->kill_one();
+    }
+    if (is_running_ && now >= next_change_) {
+        next_change_ = now + milliseconds(random_.between(500, 4000));
+        guards_->change_one();
     }
     if (now >= next_sweep_) {
         next_sweep_ = now + std::chrono::seconds(1);
-        set_operation("taking uses back");
         take_back_unknown_uses(false);
     }
     if (now >= next_sample_) {
         const double interval = std::clamp(options_.minutes * 60 / 300, 0.1, 5.0);
         next_sample_ = now + milliseconds(static_cast<int>(interval * 1000));
-        sample();
+        recorder_->sample(server_, *clients_);
     }
     read_failures();
     show_progress(false);
@@ -343,7 +180,7 @@ void Coordinator::step() {
 
 bool Coordinator::run_until(const std::function<bool()>& is_done, Clock::time_point deadline) {
     while (!is_done()) {
-        if (Clock::now() >= deadline || !server_is_wanted_) return false;
+        if (Clock::now() >= deadline || !server_is_there_) return false;
         step();
         pollfd slot = {failures_in_, POLLIN, 0};
         poll(&slot, 1, static_cast<int>(kStep.count()));
@@ -353,46 +190,25 @@ bool Coordinator::run_until(const std::function<bool()>& is_done, Clock::time_po
 
 // All fall quiet before anybody leaves: what is sent has to be received by somebody.
 void Coordinator::end_in_order() {
-    kills_are_wanted_ = false;
+    is_running_ = false;
     board_->phase = Phase::kFallQuiet;
     const auto deadline = Clock::now() + std::chrono::seconds(options_.grace);
-    const auto all = [this](const std::function<bool(unsigned)>& holds) {
-        for (unsigned i = 0; i < kClients; ++i) {
-            if (clients_[i].process.is_running() && !holds(i)) return false;
-        }
-        return true;
-    };
-    run_until(
-        [&] {
-            return all([this](unsigned i) {
-                       return !clients_[i].was_killed && board_->slots[i].stage == Stage::kQuiet;
-                   }) &&
-                   !channels_->are_some_retired();
-        },
-        deadline);
+    const auto are_all_gone = [this] { return clients_->are_all_gone(); };
+    run_until([this] { return clients_->are_all_quiet() && !channels_->are_some_retired(); }, deadline);
     board_->phase = Phase::kLeave;
-    run_until([&] { return all([](unsigned) { return false; }); }, deadline);
-    for (unsigned i = 0; i < kClients; ++i) {
-        ClientProcess& client = clients_[i];
-        if (!client.process.is_running()) continue;
-        report_failure(text_of(i, board_->slots[i]) + " (pid " + std::to_string(client.process.pid()) + "), " +
-                       stands_at(board_->slots[i]) + ": did not leave within " + std::to_string(options_.grace) + " s");
-        client.was_killed = true;
-        client.process.kill(SIGKILL);
+    if (!run_until(are_all_gone, deadline)) {
+        clients_->end_stragglers();
+        run_until(are_all_gone, Clock::now() + kKilledStragglersTime);
     }
-    if (!server_is_wanted_) return;
-    reap();
+    // Without a server nobody can give anything back.
+    if (!server_is_there_) return;
     channels_->close_all();
     guards_->close_all();
     take_back_unknown_uses(true);
 }
 
 void Coordinator::judge() {
-    const bool is_long = seconds() >= 60;
-    for (const Series& series : series_) {
-        const std::vector<Verdict> verdicts = series.judge(is_long, is_long && !is_sanitized());
-        verdicts_.insert(verdicts_.end(), verdicts.begin(), verdicts.end());
-    }
+    verdicts_ = recorder_->judge();
     for (const Verdict& v : verdicts_) {
         if (v.is_flat) continue;
         report_failure(v.process + ": its " + v.what + " grow, from " + std::to_string(v.second_quarter) +
@@ -401,35 +217,27 @@ void Coordinator::judge() {
 }
 
 int Coordinator::run() {
-    if (board_ == nullptr || failures_in_ < 0 || !samples_file_) {
+    if (board_ != nullptr) recorder_ = std::make_unique<Recorder>(*board_, options_.output);
+    if (failures_in_ < 0 || recorder_ == nullptr || !recorder_->is_good()) {
         perror("soak");
         return 2;
     }
-    for (const int signal : {SIGINT, SIGTERM}) {
-        struct sigaction action = {};
-        action.sa_handler = [](int) { g_stop = 1; };
-        sigaction(signal, &action, nullptr);
-    }
-    start_ = Clock::now();
-    const auto duration = milliseconds(static_cast<int64_t>(options_.minutes * 60000));
-    end_at(start_ + duration + std::chrono::seconds(options_.grace + kReportSeconds));
+    stop_when_interrupted();
+    const auto end = Clock::now() + milliseconds(static_cast<int64_t>(options_.minutes * 60000));
+    end_at(end + std::chrono::seconds(options_.grace) + kReportTime);
     printf("seed %llu\n", static_cast<unsigned long long>(options_.seed));
     fflush(stdout);
     std::ofstream(TAVO_STORAGE_ROOT "/shm_key_gen_file.txt") << "soak\n";
+    clients_ = std::make_unique<Clients>(*board_, options_, board_fd_, failures_out_,
+                                         [this](const std::string& line) { report_failure(line); });
     channels_ = std::make_unique<Channels>(*board_, options_.fault);
     guards_ = std::make_unique<Guards>(*board_, options_.seed);
-    series_.emplace_back("server");
-    for (unsigned i = 0; i < kSteadyClients; ++i) series_.emplace_back("client " + std::to_string(i));
     if (start_server()) {
-        next_progress_ = Clock::now();
-        run_until([this] { return g_stop != 0 || (options_.stop_at_failure && failure_count_ > 0); },
-                  start_ + duration);
+        run_until([this] { return g_stop != 0 || (options_.stop_at_failure && failure_count_ > 0); }, end);
         judge();
-        // Without a server nobody can give anything back.
-        if (server_is_wanted_) end_in_order();
+        if (server_is_there_) end_in_order();
     }
     read_failures();
-    server_is_wanted_ = false;
     server_.kill(SIGKILL);
     show_progress(true);
     const Report report(*this);

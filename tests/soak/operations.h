@@ -1,8 +1,6 @@
 // What clients do, by family. Each operation checks all that it gets, and gives back all that it takes.
 #pragma once
 
-#include <array>
-
 #include "soak/client.h"
 
 namespace tavo::soak {

@@ -33,10 +33,10 @@ std::string Report::result() const {
 }
 
 std::string Report::summary() const {
-    const auto totals = run_.totals();
-    const double seconds = std::max(run_.seconds(), 0.001);
-    return formatted("seed %llu, %.1f s, %u clients, %u kills\n", wide(run_.options_.seed), run_.seconds(), kClients,
-                     run_.kills_) +
+    const auto totals = run_.recorder_->totals();
+    const double seconds = std::max(run_.recorder_->seconds(), 0.001);
+    return formatted("seed %llu, %.1f s, %u clients, %u kills\n", wide(run_.options_.seed), run_.recorder_->seconds(),
+                     kClients, run_.clients_->kills()) +
            formatted("%llu operations (%.0f a second), %llu messages received and checked (%.0f a second), %.1f MiB\n",
                      wide(totals.operations), static_cast<double>(totals.operations) / seconds, wide(totals.messages),
                      static_cast<double>(totals.messages) / seconds, static_cast<double>(totals.bytes) / 1048576.0) +

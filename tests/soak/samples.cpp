@@ -23,9 +23,9 @@ constexpr Measure kMeasures[] = {
 constexpr long kSlackDivisor = 10;
 constexpr long kSlackOfShortRuns = 6;
 
-long median(const std::vector<Sample>& samples, size_t from, size_t to, long Holdings::*value) {
+long median(const std::vector<Holdings>& samples, size_t from, size_t to, long Holdings::*value) {
     std::vector<long> values;
-    for (size_t i = from; i < to; ++i) values.push_back(samples[i].holdings.*value);
+    for (size_t i = from; i < to; ++i) values.push_back(samples[i].*value);
     std::sort(values.begin(), values.end());
     return values[values.size() / 2];
 }
@@ -39,7 +39,7 @@ std::vector<Verdict> Series::judge(bool is_long, bool judge_memory) const {
         Verdict verdict;
         verdict.process = process_;
         verdict.what = measure.name;
-        for (const Sample& sample : samples_) verdict.most = std::max(verdict.most, sample.holdings.*measure.value);
+        for (const Holdings& sample : samples_) verdict.most = std::max(verdict.most, sample.*measure.value);
         if (count >= kLeastSamples) {
             verdict.second_quarter = median(samples_, count / 4, count / 2, measure.value);
             verdict.last_quarter = median(samples_, count - count / 4, count, measure.value);
