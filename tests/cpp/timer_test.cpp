@@ -4,6 +4,7 @@
 
 #include <atomic>
 #include <memory>
+#include <new>
 #include <string>
 #include <vector>
 
@@ -18,6 +19,7 @@ using tavo::Errc;
 using tavo::Event;
 using tavo::Timer;
 using tavo::Timers;
+using tavo::test::kOperatorNew;
 using tavo::test::LogCapture;
 using tavo::test::logged;
 using tavo::test::PlatformHook;
@@ -98,6 +100,18 @@ TEST(CppTimer, TheSixthIsRefused) {
     const Timer again(
         timers, Kind::one_shot, 10ms, [] {}, error);
     EXPECT_FALSE(error);
+}
+
+TEST(CppTimer, WithoutMemoryThereIsNoFramework) {
+    const auto refuse = +[](size_t, const std::nothrow_t&) -> void* { return nullptr; };
+    const PlatformHook hook([](const std::string& object) { return object.empty(); },  // this program
+                            (std::string(kOperatorNew) + "RKSt9nothrow_t").c_str(), reinterpret_cast<void*>(refuse));
+    ASSERT_TRUE(hook.active());
+    std::error_code error;
+    const Timers none(1s, error);
+    EXPECT_EQ(error, Errc::no_memory);
+    EXPECT_FALSE(none);
+    EXPECT_EQ(none.native_handle(), nullptr);
 }
 
 TEST(CppTimer, BadTicksAndCallbacksAreRefused) {
