@@ -4,10 +4,10 @@
 
 #include <atomic>
 #include <memory>
-#include <new>
 #include <string>
 #include <vector>
 
+#include "cpp/no_memory.h"
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
 #include "tavo_osal/cpp/event.hpp"
@@ -19,7 +19,6 @@ using tavo::Errc;
 using tavo::Event;
 using tavo::Timer;
 using tavo::Timers;
-using tavo::test::kOperatorNew;
 using tavo::test::LogCapture;
 using tavo::test::logged;
 using tavo::test::PlatformHook;
@@ -27,6 +26,7 @@ using Kind = Timer::Kind;
 
 TEST(CppTimer, FiresOnce) {
     Timers timers(1ms);
+    EXPECT_NE(timers.native_handle(), nullptr);
     Event fired;
     Timer timer(timers, Kind::one_shot, 3ms, [&] { fired.set(); });
     EXPECT_FALSE(timer.running());
@@ -103,15 +103,13 @@ TEST(CppTimer, TheSixthIsRefused) {
 }
 
 TEST(CppTimer, WithoutMemoryThereIsNoFramework) {
-    const auto refuse = +[](size_t, const std::nothrow_t&) -> void* { return nullptr; };
-    const PlatformHook hook([](const std::string& object) { return object.empty(); },  // this program
-                            (std::string(kOperatorNew) + "RKSt9nothrow_t").c_str(), reinterpret_cast<void*>(refuse));
-    ASSERT_TRUE(hook.active());
+    const tavo::test::NoMemory hook;
     std::error_code error;
     const Timers none(1s, error);
     EXPECT_EQ(error, Errc::no_memory);
     EXPECT_FALSE(none);
     EXPECT_EQ(none.native_handle(), nullptr);
+    EXPECT_THROW(Timers(1s), std::system_error);
 }
 
 TEST(CppTimer, BadTicksAndCallbacksAreRefused) {

@@ -7,6 +7,7 @@
 
 #include <cerrno>
 #include <condition_variable>
+#include <cstdarg>
 #include <cstdint>
 #include <deque>
 #include <future>
@@ -270,6 +271,36 @@ TEST(ThreadHandle, ADetachedThreadCanBeCancelledButNotJoinedOrDetachedAgain) {
     EXPECT_TRUE(logged_exactly(
         log.lines(), {{1, kTag, "Thread join failed. iRet=22\n"}, {1, kTag, "Thread detach failed. iRet=22\n"}}));
     EXPECT_EQ(tavo_osal_thread_cancel(thread), TAVO_SUCCESS);
+}
+
+long refuse_to_signal(long number, ...) {
+    va_list values;
+    va_start(values, number);
+    long value[4];
+    for (long& one : value) one = va_arg(values, long);
+    va_end(values);
+    if (number != SYS_tgkill) return syscall(number, value[0], value[1], value[2], value[3]);
+    errno = EPERM;
+    return -1;
+}
+
+TEST(ThreadHandle, ADetachedThreadThatRunsIsReachedByTheKernelsIdAndIsAlive) {
+    Bedside bedside;
+    pthread_t thread = {};
+    ASSERT_EQ(tavo_osal_thread_create(&thread, sleep_for_ever, &bedside), TAVO_SUCCESS);
+    bedside.wait_until_asleep();
+    EXPECT_EQ(tavo_osal_thread_detach(thread), TAVO_SUCCESS);
+    const LogCapture log(2);
+    {
+        const PlatformHook hook(kLibrary, "syscall", refuse_to_signal);
+        EXPECT_EQ(tavo_osal_thread_kill(thread), TAVO_FAILURE);
+        EXPECT_TRUE(logged_exactly(log.lines(), {{1, kTag, "Thread kill Failed. Error= 1\n"}}));
+    }
+    const PlatformHook hook(
+        kLibrary, "pthread_setschedparam", +[](pthread_t, int, const sched_param*) { return 0; });
+    EXPECT_EQ(tavo_osal_thread_set_real_time_priority(thread, 5, 1), TAVO_SUCCESS);
+    EXPECT_EQ(tavo_osal_thread_cancel(thread), TAVO_SUCCESS);
+    bedside.wait_until_gone();
 }
 
 // Detaches the calling thread, says so, and ends.
