@@ -39,12 +39,12 @@ target_compile_options(tavo_hardening INTERFACE
 target_link_options(tavo_hardening INTERFACE
     LINKER:-z,relro LINKER:-z,now LINKER:-z,noexecstack LINKER:-z,separate-code LINKER:-z,text)
 
-# tavo_count(TARGET): './dev coverage' counts what of it is run, in all processes together, see coverage/counters.cpp.
+# tavo_count(TARGET): './dev coverage' counts what of it is run, in all processes together, see tests/coverage/counters.cpp.
 function(tavo_count target)
     if(NOT TAVO_COVERAGE)
         return()
     endif()
-    set(folder "${CMAKE_CURRENT_FUNCTION_LIST_DIR}/coverage")
+    set(folder "${PROJECT_SOURCE_DIR}/tests/coverage")
     # Threads share the counters.
     target_compile_options(${target} PRIVATE --coverage -fprofile-update=atomic -fdata-sections)
     get_target_property(type ${target} TYPE)
