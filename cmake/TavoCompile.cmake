@@ -39,6 +39,27 @@ target_compile_options(tavo_hardening INTERFACE
 target_link_options(tavo_hardening INTERFACE
     LINKER:-z,relro LINKER:-z,now LINKER:-z,noexecstack LINKER:-z,separate-code LINKER:-z,text)
 
+# tavo_count(TARGET): './dev coverage' counts what of it is run, in all processes together, see tests/coverage/counters.cpp.
+function(tavo_count target)
+    if(NOT TAVO_COVERAGE)
+        return()
+    endif()
+    set(folder "${PROJECT_SOURCE_DIR}/tests/coverage")
+    # Threads share the counters.
+    target_compile_options(${target} PRIVATE --coverage -fprofile-update=atomic -fdata-sections)
+    get_target_property(type ${target} TYPE)
+    if(type STREQUAL "OBJECT_LIBRARY")
+        return() # linked into another
+    endif()
+    add_library(${target}_counters OBJECT "${folder}/counters.cpp")
+    target_link_libraries(${target}_counters PRIVATE tavo_compile)
+    target_compile_definitions(${target}_counters PRIVATE TAVO_COUNTERS="${PROJECT_BINARY_DIR}/counters/${target}")
+    target_sources(${target} PRIVATE $<TARGET_OBJECTS:${target}_counters>)
+    target_link_options(${target} PRIVATE --coverage LINKER:-T,${folder}/counters.ld LINKER:--wrap=__gcov_exit)
+    set_property(TARGET ${target} APPEND PROPERTY LINK_DEPENDS "${folder}/counters.ld")
+    file(MAKE_DIRECTORY "${PROJECT_BINARY_DIR}/counters")
+endfunction()
+
 find_program(CCACHE ccache)
 if(CCACHE)
     set(CMAKE_C_COMPILER_LAUNCHER ${CCACHE})

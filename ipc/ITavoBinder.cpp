@@ -131,7 +131,6 @@ status_t BnTavoBinder::onTransact(uint32_t code, const Parcel& data, Parcel* rep
             TAVO_LOG(kTag, TAVO_LOG_ERROR, "Key received at FD READ KEY  is %d", key);
             reply->writeFileDescriptor(get_fd(key), false);
             break;
-        default: break;
     }
     return NO_ERROR;
 }

@@ -4,6 +4,7 @@
 
 #include <string>
 
+#include "cpp/no_memory.h"
 #include "support/platform_fault.h"
 #include "support/process.h"
 #include "tavo_osal/init.h"
@@ -138,6 +139,21 @@ TEST_F(CppMessageQueue, FailuresOfThePipeAreReported) {
     std::vector<unsigned char> message;
     queue.get(message, error);
     EXPECT_EQ(error, Errc::queue_failure);
+}
+
+TEST_F(CppMessageQueue, WithoutMemoryAMessageStaysInTheQueue) {
+    MessageQueue queue(7);
+    queue.put("stays");
+    {
+        const tavo::test::NoMemory hook;
+        std::error_code error;
+        std::vector<unsigned char> message(3);
+        queue.get(message, error);
+        EXPECT_EQ(error, Errc::no_memory);
+        EXPECT_TRUE(message.empty());
+    }
+    EXPECT_EQ(text(queue.get()), "stays");
+    queue.close();
 }
 
 TEST_F(CppMessageQueue, AFailedCloseKeepsTheAttachment) {

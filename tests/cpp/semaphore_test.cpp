@@ -8,6 +8,7 @@
 #include <filesystem>
 #include <thread>
 
+#include "cpp/no_memory.h"
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
 
@@ -37,6 +38,14 @@ TEST(CppSemaphore, CountsAreTakenAndGivenBack) {
     EXPECT_FALSE(error) << error.message();
     semaphore.release();
     EXPECT_EQ(semaphore.value(), 1);
+}
+
+TEST(CppSemaphore, WithoutMemoryThereIsNone) {
+    const tavo::test::NoMemory hook;
+    std::error_code error;
+    const Semaphore none(1, error);
+    EXPECT_EQ(error, Errc::no_memory);
+    EXPECT_FALSE(none);
 }
 
 TEST(CppSemaphore, WakesAnotherThread) {

@@ -8,6 +8,7 @@
 #include <memory>
 #include <string>
 
+#include "cpp/no_memory.h"
 #include "support/platform_fault.h"
 #include "support/process.h"
 #include "thread/asleep.h"
@@ -186,6 +187,14 @@ TEST(CppSleep, IsRoundedUpToWhatTheCallTakes) {
     tavo::this_thread::sleep_for(0s);
     tavo::this_thread::sleep_for(-1h);
     EXPECT_EQ(g_micros, 42U);
+}
+
+TEST(CppThread, WithoutMemoryThereIsNone) {
+    const tavo::test::NoMemory hook;
+    std::error_code error;
+    const Thread none(error, [] { ADD_FAILURE() << "a thread runs"; });
+    EXPECT_EQ(error, Errc::no_memory);
+    EXPECT_FALSE(none.joinable());
 }
 
 TEST(CppSleep, AnInterruptedOneFails) {

@@ -7,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "cpp/no_memory.h"
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
 #include "tavo_osal/cpp/event.hpp"
@@ -25,6 +26,7 @@ using Kind = Timer::Kind;
 
 TEST(CppTimer, FiresOnce) {
     Timers timers(1ms);
+    EXPECT_NE(timers.native_handle(), nullptr);
     Event fired;
     Timer timer(timers, Kind::one_shot, 3ms, [&] { fired.set(); });
     EXPECT_FALSE(timer.running());
@@ -98,6 +100,16 @@ TEST(CppTimer, TheSixthIsRefused) {
     const Timer again(
         timers, Kind::one_shot, 10ms, [] {}, error);
     EXPECT_FALSE(error);
+}
+
+TEST(CppTimer, WithoutMemoryThereIsNoFramework) {
+    const tavo::test::NoMemory hook;
+    std::error_code error;
+    const Timers none(1s, error);
+    EXPECT_EQ(error, Errc::no_memory);
+    EXPECT_FALSE(none);
+    EXPECT_EQ(none.native_handle(), nullptr);
+    EXPECT_THROW(Timers(1s), std::system_error);
 }
 
 TEST(CppTimer, BadTicksAndCallbacksAreRefused) {

@@ -7,7 +7,9 @@
 
 #include <cstring>
 #include <new>
+#include <optional>
 
+#include "ipc/allocation_fault.h"
 #include "ipc/descriptors.h"
 #include "ipc/fake_binders.h"
 #include "ipc/log_lines.h"
@@ -20,6 +22,7 @@ using android::MemoryHeapBase;
 using android::Parcel;
 using android::sp;
 using android::status_t;
+using tavo::test::AllocationFault;
 using tavo::test::ExpectedLine;
 using tavo::test::FakeRemote;
 using tavo::test::file_of;
@@ -248,6 +251,21 @@ TEST_F(BinderProxyHeap, IsNullWithoutABinderInTheReply) {
     EXPECT_EQ(proxy_->get_shared_mem(5, 100), nullptr);
     remote_->answer = [](Parcel*) -> status_t { throw std::bad_alloc(); };
     EXPECT_EQ(proxy_->get_shared_mem(5, 100), nullptr);
+}
+
+TEST_F(BinderProxyHeap, IsNullWithoutMemoryForItsProxy) {
+    const sp<FakeRemote> elsewhere = new FakeRemote;
+    std::optional<AllocationFault> fault;
+    remote_->answer = [&](Parcel* reply) {
+        const status_t status = reply->writeStrongBinder(elsewhere);
+        fault.emplace(AllocationFault::kNew, 1, "libbinder.so");
+        return status;
+    };
+    const LogCapture log;
+    EXPECT_EQ(proxy_->get_shared_mem(5, 100), nullptr);
+    fault.reset();
+    EXPECT_EQ(tavo::test::g_allocations.size(), 1U);
+    EXPECT_TRUE(logged_exactly(log.lines(), {{6, kBinderTag, "++Entered\n"}, {6, kBinderTag, "--Exiting\n"}}));
 }
 
 TEST_F(BinderProxyHeap, TracesItsEntryAndExit) {

@@ -9,6 +9,7 @@
 #include <nlohmann/json.hpp>
 
 #include "ipc/TAVO_MessageQueue.h"
+#include "ipc/allocation_fault.h"
 #include "ipc/descriptors.h"
 #include "ipc/osal_service_test.h"
 #include "support/eventually.h"
@@ -19,6 +20,7 @@ namespace {
 using android::IMemoryHeap;
 using android::sp;
 using nlohmann::json;
+using tavo::test::AllocationFault;
 using tavo::test::count_descriptors;
 using tavo::test::DescriptorLimit;
 using tavo::test::Dump;
@@ -50,6 +52,23 @@ struct FullPipe {
     }
     int ends[2];
 };
+
+TEST_F(OsalServiceDump, SaysNothingWithoutMemory) {
+    start(16, 8);
+    service_->create_message_queue(7);
+    int ends[2];
+    ASSERT_EQ(pipe2(ends, O_CLOEXEC | O_NONBLOCK), 0);
+    {
+        const AllocationFault fault(AllocationFault::kNew, 1);
+        EXPECT_EQ(dump_to(ends[1]), android::NO_MEMORY);
+    }
+    char byte = 0;
+    EXPECT_EQ(read(ends[0], &byte, 1), -1);
+    EXPECT_EQ(dump_to(ends[1]), android::NO_ERROR);
+    EXPECT_EQ(read(ends[0], &byte, 1), 1);
+    close(ends[0]);
+    close(ends[1]);
+}
 
 TEST_F(OsalServiceDump, TellsPeopleOfQueuesAndBlocks) {
     start(16, 8);

@@ -75,6 +75,11 @@ TEST_F(OsalServiceInit, BuildsBothTables) {
     EXPECT_EQ(service_->delete_shared_mem(7), 0);
 }
 
+TEST_F(OsalServiceInit, MakesNothingOfAnotherInterface) {
+    EXPECT_EQ(service_->queryLocalInterface(android::String16("tavo.mq")).get(), service_.get());
+    EXPECT_EQ(service_->queryLocalInterface(android::String16("tavo.m")), nullptr);
+}
+
 TEST_F(OsalServiceInit, RefusesZeroAndBuildsNothing) {
     const unsigned arguments[][2] = {{0, 5}, {5, 0}, {0, 0}};
     for (const auto& [queues, blocks] : arguments) {

@@ -224,6 +224,14 @@ TEST_F(OsalServiceQueuesFailing, RefusesAQueueWithoutMemoryForItsRecord) {
     EXPECT_EQ(service_->create_message_queue(7), -1);
 }
 
+TEST_F(OsalServiceQueuesFailing, RefusesAQueueWithoutMemoryForItsPlaceInTheIndex) {
+    for (const size_t refused : {1U, 2U}) {  // of the order of all, and of the keys
+        const AllocationFault fault(AllocationFault::kNew, refused);
+        EXPECT_EQ(service_->create_message_queue(7), -1);
+        EXPECT_EQ(tavo::test::g_allocations.size(), refused);
+    }
+}
+
 TEST_F(OsalServiceQueues, RefusesAQueueWithoutMemoryForMoreOfThem) {
     start(2, 1);
     EXPECT_EQ(service_->create_message_queue(1), 0);

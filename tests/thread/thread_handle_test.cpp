@@ -6,7 +6,14 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <condition_variable>
+#include <cstdarg>
 #include <cstdint>
+#include <deque>
+#include <future>
+#include <mutex>
+#include <utility>
+#include <vector>
 
 #include "asleep.h"
 #include "support/log_capture.h"
@@ -145,6 +152,113 @@ TEST(ThreadHandle, AThreadOfOtherOriginWithAJoinedOnesHandleCanBeJoinedOnce) {
     EXPECT_TRUE(logged_exactly(log.lines(), {{1, kTag, "Thread join failed. iRet=3\n"}}));
 }
 
+// Joins of made-up handles, each of which lasts until the test ends it. Threads are made up as well: all have handle 0.
+class MadeUpThreads {
+public:
+    struct Join {
+        size_t place;
+        std::future<TAVO_Status> result;
+    };
+
+    MadeUpThreads() { g_threads = this; }
+    ~MadeUpThreads() { g_threads = nullptr; }
+    MadeUpThreads(const MadeUpThreads&) = delete;
+    MadeUpThreads& operator=(const MadeUpThreads&) = delete;
+
+    static pthread_t handle(size_t number) { return static_cast<pthread_t>(0x1000 * (number + 1)); }
+
+    static void create() {
+        pthread_t thread = {};
+        EXPECT_EQ(tavo_osal_thread_create(&thread, do_nothing, nullptr), TAVO_SUCCESS);
+        EXPECT_TRUE(pthread_equal(thread, handle(0)));
+    }
+    // Returns when the join waits for the thread's end.
+    Join begin_join(pthread_t thread) {
+        std::unique_lock<std::mutex> lock(mutex_);
+        const size_t place = ends_.size();
+        auto result = std::async(std::launch::async, [thread] { return tavo_osal_thread_join(thread); });
+        begun_.wait(lock, [&] { return ends_.size() > place; });
+        return {place, std::move(result)};
+    }
+    TAVO_Status end(Join& join) {
+        {
+            const std::lock_guard<std::mutex> lock(mutex_);
+            ends_[join.place].set_value();
+        }
+        return join.result.get();
+    }
+
+private:
+    int join() {
+        std::future<void> end;
+        {
+            const std::lock_guard<std::mutex> lock(mutex_);
+            end = ends_.emplace_back().get_future();
+        }
+        begun_.notify_one();
+        end.wait();
+        return 0;
+    }
+
+    static inline MadeUpThreads* g_threads = nullptr;
+    std::mutex mutex_;
+    std::condition_variable begun_;
+    std::deque<std::promise<void>> ends_;  // of all joins, in the order they began in
+    const PlatformHook create_{kLibrary, "pthread_create",
+                               +[](pthread_t* thread, const pthread_attr_t*, void* (*)(void*), void*) {
+                                   *thread = handle(0);
+                                   return 0;
+                               }};
+    const PlatformHook join_{kLibrary, "pthread_join", +[](pthread_t, void**) { return g_threads->join(); }};
+    const PlatformHook detach_{kLibrary, "pthread_detach", +[](pthread_t) { return 0; }};
+};
+
+TEST(ThreadHandle, MoreJoinsAtOnceThanAreRememberedAreAllCarriedOut) {
+    constexpr size_t kRemembered = 1024;
+    MadeUpThreads threads;
+    std::vector<MadeUpThreads::Join> joins;
+    for (size_t i = 0; i <= kRemembered; ++i) joins.push_back(threads.begin_join(threads.handle(i)));
+    const LogCapture log;
+    // That a join is going on is known of those that are remembered, and a detached thread is forgotten as well.
+    EXPECT_EQ(tavo_osal_thread_join(threads.handle(0)), TAVO_FAILURE);
+    EXPECT_TRUE(logged_exactly(log.lines(), {{1, kTag, "Thread join failed. iRet=22\n"}}));
+    joins.push_back(threads.begin_join(threads.handle(kRemembered)));
+    EXPECT_EQ(tavo_osal_thread_detach(threads.handle(kRemembered + 1)), TAVO_SUCCESS);
+    EXPECT_EQ(tavo_osal_thread_detach(threads.handle(kRemembered + 1)), TAVO_SUCCESS);
+    for (MadeUpThreads::Join& join : joins) EXPECT_EQ(threads.end(join), TAVO_SUCCESS);
+    // There are places again.
+    EXPECT_EQ(tavo_osal_thread_detach(threads.handle(kRemembered + 1)), TAVO_SUCCESS);
+    EXPECT_EQ(tavo_osal_thread_detach(threads.handle(kRemembered + 1)), TAVO_FAILURE);
+}
+
+TEST(ThreadHandle, AJoinThatEndsLateSaysNothingOfTheNextThreadWithItsHandle) {
+    MadeUpThreads threads;
+    const pthread_t thread = threads.handle(0);
+    MadeUpThreads::Join first = threads.begin_join(thread);
+    threads.create();
+    EXPECT_EQ(threads.end(first), TAVO_SUCCESS);
+    MadeUpThreads::Join second = threads.begin_join(thread);
+    threads.create();
+    MadeUpThreads::Join third = threads.begin_join(thread);
+    EXPECT_EQ(threads.end(second), TAVO_SUCCESS);
+    const LogCapture log;
+    EXPECT_EQ(tavo_osal_thread_join(thread), TAVO_FAILURE);
+    EXPECT_TRUE(logged_exactly(log.lines(), {{1, kTag, "Thread join failed. iRet=22\n"}}));
+    threads.create();
+    EXPECT_EQ(tavo_osal_thread_detach(thread), TAVO_SUCCESS);
+    EXPECT_EQ(threads.end(third), TAVO_SUCCESS);
+    EXPECT_EQ(tavo_osal_thread_detach(thread), TAVO_FAILURE);
+}
+
+TEST(ThreadHandle, AThreadThatHasEndedAndIsBeingJoinedCannotBeKilled) {
+    MadeUpThreads threads;
+    MadeUpThreads::Join join = threads.begin_join(threads.handle(0));
+    const LogCapture log;
+    EXPECT_EQ(tavo_osal_thread_kill(threads.handle(0)), TAVO_FAILURE);
+    EXPECT_TRUE(logged_exactly(log.lines(), {{1, kTag, "Thread kill Failed. Error= 3\n"}}));
+    EXPECT_EQ(threads.end(join), TAVO_SUCCESS);
+}
+
 TEST(ThreadHandle, ADetachedThreadCanBeCancelledButNotJoinedOrDetachedAgain) {
     Bedside bedside;
     pthread_t thread = {};
@@ -157,6 +271,36 @@ TEST(ThreadHandle, ADetachedThreadCanBeCancelledButNotJoinedOrDetachedAgain) {
     EXPECT_TRUE(logged_exactly(
         log.lines(), {{1, kTag, "Thread join failed. iRet=22\n"}, {1, kTag, "Thread detach failed. iRet=22\n"}}));
     EXPECT_EQ(tavo_osal_thread_cancel(thread), TAVO_SUCCESS);
+}
+
+long refuse_to_signal(long number, ...) {
+    va_list values;
+    va_start(values, number);
+    long value[4];
+    for (long& one : value) one = va_arg(values, long);
+    va_end(values);
+    if (number != SYS_tgkill) return syscall(number, value[0], value[1], value[2], value[3]);
+    errno = EPERM;
+    return -1;
+}
+
+TEST(ThreadHandle, ADetachedThreadThatRunsIsReachedByTheKernelsIdAndIsAlive) {
+    Bedside bedside;
+    pthread_t thread = {};
+    ASSERT_EQ(tavo_osal_thread_create(&thread, sleep_for_ever, &bedside), TAVO_SUCCESS);
+    bedside.wait_until_asleep();
+    EXPECT_EQ(tavo_osal_thread_detach(thread), TAVO_SUCCESS);
+    const LogCapture log(2);
+    {
+        const PlatformHook hook(kLibrary, "syscall", refuse_to_signal);
+        EXPECT_EQ(tavo_osal_thread_kill(thread), TAVO_FAILURE);
+        EXPECT_TRUE(logged_exactly(log.lines(), {{1, kTag, "Thread kill Failed. Error= 1\n"}}));
+    }
+    const PlatformHook hook(
+        kLibrary, "pthread_setschedparam", +[](pthread_t, int, const sched_param*) { return 0; });
+    EXPECT_EQ(tavo_osal_thread_set_real_time_priority(thread, 5, 1), TAVO_SUCCESS);
+    EXPECT_EQ(tavo_osal_thread_cancel(thread), TAVO_SUCCESS);
+    bedside.wait_until_gone();
 }
 
 // Detaches the calling thread, says so, and ends.

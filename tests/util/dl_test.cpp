@@ -84,6 +84,13 @@ TEST(DynamicLoading, ReportsAnObjectThatCannotBeOpened) {
         log.lines(), {{1, "OSAL_DL", std::string("Failed to open ") + kMissing + "\n"}, {1, "OSAL_DL", words + "\n"}}));
 }
 
+TEST(DynamicLoading, ReportsNothingThatTheFilterDrops) {
+    const LogCapture log(0);
+    void* handle = nullptr;
+    EXPECT_EQ(tavo_osal_dlopen(kMissing, RTLD_NOW, &handle), TAVO_DL_OPEN_FAILED);
+    EXPECT_TRUE(log.lines().empty());
+}
+
 TEST(DynamicLoading, ReportsAnObjectThatCannotBeOpenedWhenThePlatformHasNoWords) {
     const PlatformHook open_hook(
         "libtavoosal.so", "dlopen", +[](const char*, int) -> void* { return nullptr; });

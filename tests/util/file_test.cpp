@@ -14,6 +14,7 @@
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
 #include "support/process.h"
+#include "tavo_osal/log.h"
 
 namespace {
 
@@ -203,10 +204,14 @@ TEST_F(File, ReportsAPositionThatCannotBeRead) {
             errno = EOVERFLOW;
             return -7;
         });
-    const LogCapture log;
+    LogCapture log;
     EXPECT_EQ(tavo_osal_get_file_size(kPath), -7);
     EXPECT_TRUE(logged_exactly(
         log.lines(), {{1, "OSAL_FILE", "Error in getting file size. Errno = " + std::to_string(EOVERFLOW) + "\n"}}));
+    log.clear();
+    g_uiMxEnabledLogLevel = TAVO_LOG_PERFORMANCE;
+    EXPECT_EQ(tavo_osal_get_file_size(kPath), -7);
+    EXPECT_TRUE(log.lines().empty());
 }
 
 TEST_F(File, OpensTheFileForItsSizeCloseOnExec) {

@@ -10,6 +10,7 @@
 
 #include "support/log_capture.h"
 #include "support/platform_fault.h"
+#include "tavo_osal/log.h"
 
 namespace {
 
@@ -38,6 +39,20 @@ TEST(Memory, GivesMallocTheWholeUnsignedSize) {
     EXPECT_EQ(tavo_osal_mem_malloc(UINT32_MAX), nullptr);
     EXPECT_EQ(asked, size_t{UINT32_MAX});
     EXPECT_TRUE(logged_exactly(log.lines(), {{1, "OSAL_MEM", "Memory not allocated. Size Requested: -1.\n"}}));
+}
+
+TEST(Memory, ReportsNothingThatTheFilterDrops) {
+    const PlatformHook malloc_hook(
+        "libtavoosal.so", "malloc", +[](size_t) -> void* { return nullptr; });
+    const PlatformHook calloc_hook(
+        "libtavoosal.so", "calloc", +[](size_t, size_t) -> void* { return nullptr; });
+    const PlatformHook realloc_hook(
+        "libtavoosal.so", "realloc", +[](void*, size_t) -> void* { return nullptr; });
+    const LogCapture log(TAVO_LOG_PERFORMANCE);
+    EXPECT_EQ(tavo_osal_mem_malloc(1), nullptr);
+    EXPECT_EQ(tavo_osal_mem_calloc(1, 1), nullptr);
+    EXPECT_EQ(tavo_osal_mem_realloc(nullptr, 1), nullptr);
+    EXPECT_TRUE(log.lines().empty());
 }
 
 TEST(Memory, ReportsAFailedMallocWithItsSize) {

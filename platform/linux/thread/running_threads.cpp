@@ -18,7 +18,9 @@
 
 namespace {
 
-constexpr int kRounds = 20;
+// How long a thread without a list is waited for: on a busy machine a new one may have to wait for its first turn. One
+// that the C library has not made never has a list.
+constexpr int kRounds = 1000;
 constexpr timespec kPause = {0, 1000000};
 
 // False for a thread that has ended meanwhile, or where the kernel does not answer.

@@ -87,6 +87,38 @@ TEST(DriverDeath, IsToldToEveryRecipientOnce) {
     EXPECT_EQ(gone->deaths, 0);
 }
 
+TEST(DriverDeath, IsToldToNobodyOnceAllHaveLeft) {
+    start_pool();
+    Process server = start_server(), other = start_server("other");
+    const sp<IBinder> service = find_service(), later = find_service("other");
+    const sp<Recipient> gone = new Recipient, stays = new Recipient;
+    for (int i = 0; i < 2; ++i) {
+        EXPECT_EQ(service->linkToDeath(gone), OK);
+        EXPECT_EQ(service->unlinkToDeath(gone), OK);
+    }
+    EXPECT_EQ(service->unlinkToDeath(gone), NAME_NOT_FOUND);
+    EXPECT_EQ(later->linkToDeath(stays), OK);
+    server.kill(SIGKILL);
+    server.wait();
+    EXPECT_EQ(service->pingBinder(), DEAD_OBJECT);
+    other.kill(SIGKILL);
+    EXPECT_TRUE(comes_true([&] { return stays->deaths == 1; }));
+    EXPECT_EQ(gone->deaths, 0);
+}
+
+TEST(DriverDeath, IsToldAgainToWhoComesBack) {
+    start_pool();
+    Process server = start_server();
+    const sp<IBinder> service = find_service();
+    const sp<Recipient> recipient = new Recipient;
+    EXPECT_EQ(service->linkToDeath(recipient), OK);
+    EXPECT_EQ(service->unlinkToDeath(recipient), OK);
+    EXPECT_EQ(service->linkToDeath(recipient), OK);
+    server.kill(SIGKILL);
+    EXPECT_TRUE(comes_true([&] { return recipient->deaths == 1; }));
+    EXPECT_EQ(recipient->last, service);
+}
+
 TEST(DriverDeath, IsToldWhileCallsAreUnderWay) {
     start_pool();
     for (int i = 0; i < 10; ++i) {

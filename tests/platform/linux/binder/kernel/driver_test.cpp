@@ -181,6 +181,14 @@ TEST_F(KernelCall, ReturnsTheStatusInsteadOfAReply) {
     EXPECT_EQ(device_.buffers_in_use(), 0U);
 }
 
+TEST_F(KernelCall, GivesAReplyBackThatNobodyWaitsFor) {
+    const int32_t value = 43;
+    device_.say(Said().add(BR_REPLY, device_.parcel(&value, sizeof value)).add(BR_TRANSACTION_COMPLETE));
+    EXPECT_EQ(call(nullptr, IBinder::FLAG_ONEWAY), OK);
+    IPCThreadState::self()->flushCommands();
+    EXPECT_EQ(device_.buffers_in_use(), 0U);
+}
+
 TEST_F(KernelCall, OfADeadObjectFindsOut) {
     device_.say(Said().add(BR_NOOP).add(BR_DEAD_REPLY));
     EXPECT_EQ(call(), DEAD_OBJECT);

@@ -1,4 +1,5 @@
 // How far the socket driver goes where the kernel's does not: sizes, numbers, and processes without a pool.
+#include <linux/android/binder.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -23,6 +24,18 @@ TEST(SocketObject, GoesAwayWithThePoollessProcessesNextCall) {
     ASSERT_EQ(ask(service, TestService::kKeep, new TestService), 0);
     ASSERT_EQ(ask(service, TestService::kKeep, nullptr), 0);
     EXPECT_TRUE(comes_true([&] { return service->pingBinder() == OK && TestService::count() == 0; }));
+}
+
+TEST(SocketObject, OfATypeThatIsNotCarriedFailsTheCallAlone) {
+    const Process server = start_server();
+    const sp<IBinder> service = find_service();
+    flat_binder_object object{};
+    object.hdr.type = BINDER_TYPE_WEAK_BINDER;
+    const binder_size_t offset = 0;
+    Parcel data, reply;
+    data.ipcSetDataReference(reinterpret_cast<const uint8_t*>(&object), sizeof object, &offset, 1, nullptr, nullptr);
+    EXPECT_EQ(service->transact(TestService::kEcho, data, &reply), FAILED_TRANSACTION);
+    EXPECT_EQ(service->pingBinder(), OK);
 }
 
 TEST(SocketOneway, OfAnySizeIsAcceptedAlone) {

@@ -53,6 +53,16 @@ TEST_F(SocketHostileClient, IsServedLikeOthersAsLongAsItBehaves) {
     EXPECT_TRUE(is_open(peer.control()));
 }
 
+TEST_F(SocketHostileClient, AsksTheDirectoryForMoreThanLookUps) {
+    const RawPeer peer("test.service");
+    const UniqueFd channel = peer.open_channel(wire::Purpose::kDirectory);
+    ASSERT_TRUE(send_raw(channel.get(), transaction(wire::kDirectoryNode, 4711).bytes()));
+    const ReceivedFrame reply = receive_frame(channel.get());
+    EXPECT_TRUE(reply.is(FrameType::kReply));
+    EXPECT_EQ(reply.status(), UNKNOWN_TRANSACTION);
+    EXPECT_TRUE(is_open(peer.control()));
+}
+
 TEST_F(SocketHostileClient, SendsHeadersThatAreNone) {
     const auto header = [](const std::function<void(wire::FrameHeader&)>& change) {
         wire::FrameHeader changed = echo().sized();
