@@ -227,7 +227,7 @@ std::vector<Contest> log_contests() {
          {},
          1,
          {dropped<Bare>("bare compare", Role::limit), dropped<Ours>("TAVO log", Role::ours),
-          dropped<OurMacro>("TAVO log, in the library", Role::peer), dropped<Spdlog<true>>("spdlog", Role::peer)}},
+          dropped<OurMacro>("TAVO log, in the library", Role::ours), dropped<Spdlog<true>>("spdlog", Role::peer)}},
         written("written line", 1, -1),
         written("written line, two threads", 1, places(1).second),
         written("written line, two threads", 2, places(2).second),
