@@ -1,4 +1,4 @@
-// A second thread for contests within one process, on a CPU of its own or on the first one's.
+// For contests within one process: a second thread, on a CPU of its own or on the first one's.
 #pragma once
 
 #include <condition_variable>
@@ -7,6 +7,7 @@
 #include <utility>
 
 #include "bench/cpus.h"
+#include "peer.h"
 
 namespace tavo::peers {
 
@@ -65,5 +66,24 @@ private:
     bool busy_ = false;
     std::thread thread_;  // last: it uses the others from its start
 };
+
+// One process. What it does is told on which CPU a second thread is wanted, or that none is.
+constexpr int kNoHelper = -1;
+
+template <typename Work>
+class Alone : public Setting {
+public:
+    explicit Alone(int helper_cpu) : helper_cpu_(helper_cpu) {}
+    std::unique_ptr<Party> driver() override { return std::make_unique<Work>(helper_cpu_); }
+    bool has_partner() const override { return false; }
+
+private:
+    const int helper_cpu_;
+};
+
+template <typename Work>
+Peer alone(const char* name, Role role, int helper_cpu) {
+    return {name, role, [helper_cpu] { return std::make_unique<Alone<Work>>(helper_cpu); }};
+}
 
 }  // namespace tavo::peers

@@ -44,7 +44,7 @@ template <typename Mutex>
 class Counting : public Party {
 public:
     explicit Counting(int helper_cpu) {
-        if (helper_cpu >= 0) helper_.emplace(helper_cpu, [this](size_t operations) { count(operations); });
+        if (helper_cpu != kNoHelper) helper_.emplace(helper_cpu, [this](size_t operations) { count(operations); });
     }
 
     void run(size_t operations) override {
@@ -272,22 +272,6 @@ private:
 
 // --- the contests
 
-template <typename Work>
-class Alone : public Setting {
-public:
-    explicit Alone(int helper_cpu) : helper_cpu_(helper_cpu) {}
-    std::unique_ptr<Party> driver() override { return std::make_unique<Work>(helper_cpu_); }
-    bool has_partner() const override { return false; }
-
-private:
-    const int helper_cpu_;
-};
-
-template <typename Work>
-Peer peer(const char* name, Role role, int helper_cpu) {
-    return {name, role, [helper_cpu] { return std::make_unique<Alone<Work>>(helper_cpu); }};
-}
-
 template <typename Signal>
 Peer processes(const char* name, Role role) {
     return {name, role, [] { return std::make_unique<Shared<Signal>>(); }};
@@ -298,15 +282,15 @@ Contest mutexes(const char* operation, int cpus, int helper_cpu) {
             operation,
             {},
             cpus,
-            {peer<Counting<BareMutex>>("pthread mutex", Role::limit, helper_cpu),
-             peer<Counting<OurMutex>>("TAVO mutex", Role::ours, helper_cpu),
-             peer<Counting<std::mutex>>("std::mutex", Role::peer, helper_cpu)}};
+            {alone<Counting<BareMutex>>("pthread mutex", Role::limit, helper_cpu),
+             alone<Counting<OurMutex>>("TAVO mutex", Role::ours, helper_cpu),
+             alone<Counting<std::mutex>>("std::mutex", Role::peer, helper_cpu)}};
 }
 
 }  // namespace
 
 std::vector<Contest> lock_contests() {
-    std::vector<Contest> contests = {mutexes("mutex, one thread", 1, -1)};
+    std::vector<Contest> contests = {mutexes("mutex, one thread", 1, kNoHelper)};
     for (const int cpus : {1, 2}) contests.push_back(mutexes("mutex, two threads", cpus, places(cpus).second));
     for (const int cpus : {1, 2}) {
         const int cpu = places(cpus).second;
@@ -314,9 +298,9 @@ std::vector<Contest> lock_contests() {
                             "semaphore there and back, threads",
                             {},
                             cpus,
-                            {peer<Threads<BareSemaphore<false>>>("sem_t", Role::limit, cpu),
-                             peer<Threads<OurSemaphore>>("TAVO semaphore", Role::ours, cpu),
-                             peer<Threads<BoostSemaphore>>("Boost.Interprocess semaphore", Role::peer, cpu)}});
+                            {alone<Threads<BareSemaphore<false>>>("sem_t", Role::limit, cpu),
+                             alone<Threads<OurSemaphore>>("TAVO semaphore", Role::ours, cpu),
+                             alone<Threads<BoostSemaphore>>("Boost.Interprocess semaphore", Role::peer, cpu)}});
     }
     for (const int cpus : {1, 2}) {
         const int cpu = places(cpus).second;
@@ -324,9 +308,9 @@ std::vector<Contest> lock_contests() {
                             "event there and back, threads",
                             {},
                             cpus,
-                            {peer<Threads<BareCondition>>("pthread condition", Role::limit, cpu),
-                             peer<Threads<OurEvent>>("TAVO event", Role::ours, cpu),
-                             peer<Threads<StandardCondition>>("std::condition_variable", Role::peer, cpu)}});
+                            {alone<Threads<BareCondition>>("pthread condition", Role::limit, cpu),
+                             alone<Threads<OurEvent>>("TAVO event", Role::ours, cpu),
+                             alone<Threads<StandardCondition>>("std::condition_variable", Role::peer, cpu)}});
     }
     for (const int cpus : {1, 2}) {
         contests.push_back({"locks",

@@ -130,9 +130,8 @@ private:
 template <typename Logger>
 class Lines : public Party {
 public:
-    // helper_cpu: -1 for one thread.
     explicit Lines(int helper_cpu) {
-        if (helper_cpu >= 0) helper_.emplace(helper_cpu, [this](size_t operations) { write(operations); });
+        if (helper_cpu != kNoHelper) helper_.emplace(helper_cpu, [this](size_t operations) { write(operations); });
     }
 
     void run(size_t operations) override {
@@ -166,6 +165,8 @@ private:
 template <typename Logger>
 class DroppedLines : public Party {
 public:
+    explicit DroppedLines(int) {}
+
     void run(size_t operations) override {
         for (uint64_t value = 1; value <= operations; ++value) logger_.drop(value);
     }
@@ -181,41 +182,16 @@ private:
     Tally tally_;
 };
 
-template <typename Work>
-class Alone : public Setting {
-public:
-    explicit Alone(Work work) : work_(work) {}
-    std::unique_ptr<Party> driver() override { return work_(); }
-    bool has_partner() const override { return false; }
-
-private:
-    const Work work_;
-};
-
-template <typename Work>
-Peer alone(const char* name, Role role, Work work) {
-    return {name, role, [work] { return std::make_unique<Alone<Work>>(work); }};
-}
-
-template <typename Logger>
-Peer lines(const char* name, Role role, int helper_cpu) {
-    return alone(name, role, [helper_cpu] { return std::make_unique<Lines<Logger>>(helper_cpu); });
-}
-
-template <typename Logger>
-Peer dropped(const char* name, Role role) {
-    return alone(name, role, [] { return std::make_unique<DroppedLines<Logger>>(); });
-}
-
 Contest written(const char* operation, int cpus, int helper_cpu) {
     return {"logging",
             operation,
             {},
             cpus,
-            {lines<Bare>("bare write", Role::limit, helper_cpu), lines<Ours>("TAVO log", Role::ours, helper_cpu),
-             lines<Platform>("liblog", Role::peer, helper_cpu),
-             lines<Spdlog<true>>("spdlog, flushed", Role::peer, helper_cpu),
-             lines<Spdlog<false>>("spdlog, buffered", Role::peer, helper_cpu)}};
+            {alone<Lines<Bare>>("bare write", Role::limit, helper_cpu),
+             alone<Lines<Ours>>("TAVO log", Role::ours, helper_cpu),
+             alone<Lines<Platform>>("liblog", Role::peer, helper_cpu),
+             alone<Lines<Spdlog<true>>>("spdlog, flushed", Role::peer, helper_cpu),
+             alone<Lines<Spdlog<false>>>("spdlog, buffered", Role::peer, helper_cpu)}};
 }
 
 }  // namespace
@@ -226,9 +202,11 @@ std::vector<Contest> log_contests() {
          "dropped line",
          {},
          1,
-         {dropped<Bare>("bare compare", Role::limit), dropped<Ours>("TAVO log", Role::ours),
-          dropped<OurMacro>("TAVO log, in the library", Role::ours), dropped<Spdlog<true>>("spdlog", Role::peer)}},
-        written("written line", 1, -1),
+         {alone<DroppedLines<Bare>>("bare compare", Role::limit, kNoHelper),
+          alone<DroppedLines<Ours>>("TAVO log", Role::ours, kNoHelper),
+          alone<DroppedLines<OurMacro>>("TAVO log, in the library", Role::ours, kNoHelper),
+          alone<DroppedLines<Spdlog<true>>>("spdlog", Role::peer, kNoHelper)}},
+        written("written line", 1, kNoHelper),
         written("written line, two threads", 1, places(1).second),
         written("written line, two threads", 2, places(2).second),
     };

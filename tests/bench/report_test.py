@@ -76,6 +76,13 @@ class PageTest(unittest.TestCase):
         self.assertNotIn(texts.why("queues", "stream", "ZeroMQ"), text)
         self.assertNotIn(texts.why("queues", "stream", "nng"), text)
 
+    def test_a_peer_that_is_ahead_in_two_rounds_of_three_only_is_not_called_ahead(self):
+        erratic = peer("nng", "peer", 900)
+        erratic["to_ours"]["high"] = 1.02
+        self.assertIn("Nowhere in this run.", page(contest("stream", 64, 1, erratic)))
+        erratic["to_ours"]["high"] = 0.98
+        self.assertNotIn("Nowhere in this run.", page(contest("stream", 64, 1, erratic)))
+
     def test_the_limit_and_this_library_are_not_called_ahead(self):
         macro = peer("TAVO log, in the library", "ours", 1)
         text = page(contest("dropped line", None, 1, macro, family="logging"))
