@@ -165,6 +165,14 @@ TEST_F(KernelMachine, RefusesDescriptorsForAProcessThatCanHaveNoMore) {
 
 // -- Threads
 
+// How many of the thread's objects go when a signal's handler ends it: on 32-bit ARM, the C library cannot unwind past
+// the handler.
+#ifdef __arm__
+constexpr int kUnwound = 0;
+#else
+constexpr int kUnwound = 1;
+#endif
+
 // As a program that cancels a thread by a signal.
 void end_thread(int) { pthread_exit(nullptr); }
 
@@ -188,7 +196,7 @@ TEST_F(KernelMachine, LetsAThreadBeEndedWhileItWaitsForAReply) {
         ASSERT_TRUE(gate.wait_for(1));
         pthread_kill(caller.native_handle(), SIGUSR2);
         caller.join();
-        EXPECT_EQ(unwound, 1);
+        EXPECT_EQ(unwound, kUnwound);
         EXPECT_EQ(service->pingBinder(), OK);
         gate.open();
         EXPECT_EQ(service->pingBinder(), OK) << "a reply that nobody waits for any more hurts nobody";

