@@ -149,6 +149,13 @@ std::vector<double> ratios(const std::vector<double>& times, const std::vector<d
     return result;
 }
 
+// The part of the rounds in which these times were the shorter ones.
+double share_of_wins(const std::vector<double>& times, const std::vector<double>& to) {
+    size_t wins = 0;
+    for (size_t i = 0; i < times.size(); ++i) wins += times[i] < to[i] ? 1 : 0;
+    return static_cast<double>(wins) / static_cast<double>(times.size());
+}
+
 nlohmann::json record(const Peer& peer) {
     static constexpr const char* kRoles[] = {"limit", "ours", "peer"};
     return {{"name", peer.name}, {"role", kRoles[static_cast<size_t>(peer.role)]}};
@@ -207,6 +214,7 @@ nlohmann::json run(const Contest& contest, const Plan& plan) {
         peers.back()["nanoseconds"] = spread(times[i]);
         peers.back()["to_limit"] = spread(ratios(times[i], times_of(Role::limit)));
         peers.back()["to_ours"] = spread(ratios(times[i], times_of(Role::ours)));
+        peers.back()["ahead_of_ours"] = share_of_wins(times[i], times_of(Role::ours));
     }
     nlohmann::json result = {
         {"family", contest.family}, {"operation", contest.operation}, {"cpus", contest.cpus}, {"peers", peers}};

@@ -86,12 +86,15 @@ TEST(PeerRunner, RecordsTimesAndRatiosOfEveryPeer) {
     ASSERT_EQ(record["peers"].size(), 3U);
     for (const auto& one : record["peers"]) {
         EXPECT_GT(one["operations"], 0);
+        EXPECT_GE(one["ahead_of_ours"], 0.0);
+        EXPECT_LE(one["ahead_of_ours"], 1.0);
         for (const char* figure : {"nanoseconds", "to_limit", "to_ours"}) {
             EXPECT_GT(one[figure]["low"], 0) << figure;
             EXPECT_LE(one[figure]["low"], one[figure]["median"]) << figure;
             EXPECT_LE(one[figure]["median"], one[figure]["high"]) << figure;
         }
     }
+    EXPECT_EQ(named(record, "mine")["ahead_of_ours"], 0.0);
     EXPECT_EQ(named(record, "bare")["role"], "limit");
     EXPECT_EQ(named(record, "bare")["to_limit"]["high"], 1.0);
     EXPECT_EQ(named(record, "mine")["role"], "ours");
