@@ -59,10 +59,10 @@ int main(int argc, char** argv) {
     bool quick = false;
     for (int i = 1; i < argc; ++i) {
         if (strcmp(argv[i], "--quick") == 0) {
-            plan = {21, 2};
+            plan = {2, 10, 2};
             quick = true;
         } else if (strcmp(argv[i], "--smoke") == 0) {
-            plan = {2, 0.1};
+            plan = {1, 2, 0.1};
             quick = true;
         } else {
             families.emplace_back(argv[i]);
@@ -75,7 +75,7 @@ int main(int argc, char** argv) {
 
     json result = {{"date", today()},
                    {"quick", quick},
-                   {"rounds", plan.rounds},
+                   {"rounds", plan.starts * plan.rounds},
                    {"round_milliseconds", plan.round_milliseconds},
                    {"machine", tavo::peers::machine()},
                    {"versions", tavo::peers::versions()},

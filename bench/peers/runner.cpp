@@ -2,7 +2,8 @@
 // for orders; the runner itself does nothing while a peer is timed.
 //
 // All peers are measured in every round, one after the other, and each round begins with another one. So a drift of the
-// machine's speed meets all of them, and what counts is the ratio to the bare limit within a round.
+// machine's speed meets all of them, and what counts is the ratio to the bare limit within a round. The processes are
+// started anew several times, because where memory happens to lie makes one faster than the next.
 #include "runner.h"
 
 #include <fcntl.h>
@@ -91,7 +92,7 @@ private:
 // One peer, taking part.
 class Contestant {
 public:
-    Contestant(const Peer& peer, const Places& places) : peer_(peer), setting_(peer.set_up()) {
+    Contestant(const Peer& peer, const Places& places) : setting_(peer.set_up()) {
         if (setting_->has_partner()) {
             partner_.emplace(places.second, peer.name + "'s partner", [this] { return setting_->partner(); });
         }
@@ -105,7 +106,6 @@ public:
     Contestant(const Contestant&) = delete;
     Contestant& operator=(const Contestant&) = delete;
 
-    const Peer& peer() const { return peer_; }
     size_t operations() const { return operations_; }
 
     // As many operations as fill a round; also warms up. Several tries, as one may be held up by another program.
@@ -129,7 +129,6 @@ public:
     }
 
 private:
-    const Peer& peer_;
     const std::unique_ptr<Setting> setting_;
     std::optional<Worker> partner_;
     std::optional<Worker> driver_;
@@ -181,25 +180,31 @@ Places places(int cpus) {
 }
 
 nlohmann::json run(const Contest& contest, const Plan& plan) {
-    std::vector<std::unique_ptr<Contestant>> contestants;
+    std::vector<const Peer*> able;
     for (const Peer& peer : contest.peers) {
-        if (!peer.impossible.empty()) continue;
-        contestants.push_back(std::make_unique<Contestant>(peer, places(contest.cpus)));
-        contestants.back()->calibrate(plan.round_milliseconds * 1e6);
+        if (peer.impossible.empty()) able.push_back(&peer);
     }
-
-    std::vector<std::vector<double>> times(contestants.size());
-    for (size_t round = 0; round < plan.rounds; ++round) {
-        for (size_t i = 0; i < contestants.size(); ++i) {
-            const size_t turn = (round + i) % contestants.size();
-            times[turn].push_back(contestants[turn]->round());
+    std::vector<std::vector<double>> times(able.size());
+    std::vector<size_t> operations(able.size());
+    for (size_t start = 0; start < plan.starts; ++start) {
+        std::vector<std::unique_ptr<Contestant>> contestants;
+        for (size_t i = 0; i < able.size(); ++i) {
+            contestants.push_back(std::make_unique<Contestant>(*able[i], places(contest.cpus)));
+            contestants[i]->calibrate(plan.round_milliseconds * 1e6);
+        }
+        for (size_t round = 0; round < plan.rounds; ++round) {
+            for (size_t i = 0; i < able.size(); ++i) {
+                const size_t turn = (round + i) % able.size();
+                times[turn].push_back(contestants[turn]->round());
+                operations[turn] += contestants[turn]->operations();
+            }
         }
     }
 
     const auto times_of = [&](Role role) {
-        const auto found = std::find_if(contestants.begin(), contestants.end(),
-                                        [role](const auto& one) { return one->peer().role == role; });
-        return times[static_cast<size_t>(found - contestants.begin())];
+        const auto found =
+            std::find_if(able.begin(), able.end(), [role](const Peer* one) { return one->role == role; });
+        return times[static_cast<size_t>(found - able.begin())];
     };
     nlohmann::json peers = nlohmann::json::array();
     for (const Peer& peer : contest.peers) {
@@ -208,9 +213,9 @@ nlohmann::json run(const Contest& contest, const Plan& plan) {
             peers.back()["impossible"] = peer.impossible;
         }
     }
-    for (size_t i = 0; i < contestants.size(); ++i) {
-        peers.push_back(record(contestants[i]->peer()));
-        peers.back()["operations"] = contestants[i]->operations();
+    for (size_t i = 0; i < able.size(); ++i) {
+        peers.push_back(record(*able[i]));
+        peers.back()["operations"] = operations[i];
         peers.back()["nanoseconds"] = spread(times[i]);
         peers.back()["to_limit"] = spread(ratios(times[i], times_of(Role::limit)));
         peers.back()["to_ours"] = spread(ratios(times[i], times_of(Role::ours)));

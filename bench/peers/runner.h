@@ -8,7 +8,8 @@
 namespace tavo::peers {
 
 struct Plan {
-    size_t rounds = 101;
+    size_t starts = 4;
+    size_t rounds = 26;  // after each start
     double round_milliseconds = 5;
 };
 

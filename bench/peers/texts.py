@@ -11,7 +11,8 @@ HOW_TO_READ = """\
 With `--quick` it takes half a minute, and the page goes to `build/benchmarks` instead, as it does where only some families are named.
 
 Every peer has one process or two of its own. All peers take turns within every round, and each round begins with another one, so that a
-machine whose speed drifts, or that does other work, slows all of them down; run as root, they also go before that work. **The figures to trust are the ratios**: a peer's time by
+machine whose speed drifts, or that does other work, slows all of them down; run as root, they also go before that work.
+The processes are started anew several times, because where memory happens to lie makes one faster than the next. **The figures to trust are the ratios**: a peer's time by
 the bare limit's in the same round. A cell has the median of the rounds' ratios, the quartiles in brackets (a quarter of the rounds was
 below the first one, a quarter above the second one), and the median time of one operation. Below 1 is faster than the bare limit, which is the
 plainest way of using the platform's call and not the fastest.

@@ -14,7 +14,7 @@ namespace {
 
 using namespace tavo::peers;
 
-constexpr Plan kPlan = {4, 0.01};
+constexpr Plan kPlan = {1, 4, 0.01};
 
 enum class Fault { none, loses, forges, ends };
 
@@ -125,6 +125,16 @@ TEST(PeerRunner, LetsEveryPeerHaveATurnInEachRoundAndBeginsEachWithAnother) {
     const std::vector<int> last(turns->names + (turns->count - measured), turns->names + turns->count);
     EXPECT_EQ(last, std::vector<int>({0, 1, 2, 1, 2, 0, 2, 0, 1, 0, 1, 2}));
     munmap(memory, sizeof(Turns));
+}
+
+TEST(PeerRunner, StartsThePeersAnewAsOftenAsPlanned) {
+    int starts = 0;
+    const Peer other = {"other", Role::peer, [&starts] {
+                            ++starts;
+                            return std::make_unique<Alone>(Fault::none, 0, nullptr);
+                        }};
+    run(contest({other}), {3, 2, 0.01});
+    EXPECT_EQ(starts, 3);
 }
 
 TEST(PeerRunnerDeathTest, EndsWhenAPeerLosesSomething) {
