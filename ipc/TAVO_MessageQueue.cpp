@@ -56,10 +56,13 @@ int32_t receive(TAVO_MessageQueue& queue, unsigned char* buffer, size_t room, un
     // A pipe takes first what is over whole pages. So the length may be all that came of a message of whole pages
     // whose sender was killed, and nobody would ever end a read of the rest.
     const bool may_be_torn = length != 0 && length % kSmallestPage == 0;
-    if (whole && (!may_be_torn || tavo::comes(queue.iReadFd))) {
-        count = tavo::read_all(queue.iReadFd, buffer, room, std::min<size_t>(length, kMaxMessage), true);
+    const size_t expected = std::min<size_t>(length, kMaxMessage);
+    if (whole && may_be_torn) {
+        count = tavo::read_all_that_comes(queue.iReadFd, buffer, room, expected);
+    } else if (whole) {
+        count = tavo::read_all(queue.iReadFd, buffer, room, expected, true);
     } else if (count > 0) {
-        count = 0;  // no message follows a length that did not come whole, or behind which nothing comes
+        count = 0;  // no message follows a length that did not come whole
     }
     if (count < 0) {
         TAVO_LOG(kTag, TAVO_LOG_ERROR, "read() error: %s :Message queue (%.64s)\n", strerror(errno),

@@ -3,9 +3,15 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/ioctl.h>
+#include <sys/uio.h>
 
+#include <atomic>
 #include <cerrno>
 #include <chrono>
+
+// Not every platform's C library has it, nor declares it where it has.
+extern "C" ssize_t read_with_flags(int, const iovec*, int, long offset, int flags) __asm__("preadv2")
+    __attribute__((weak));
 
 namespace tavo {
 namespace {
@@ -35,6 +41,24 @@ bool becomes_ready(int fd, short events) {
     }
 }
 
+// Waits until something can be read, or the other side has gone.
+bool comes(int fd) {
+    // Far cheaper than a poll, which tells no more when something is there.
+    int bytes = 0;
+    return (ioctl(fd, FIONREAD, &bytes) == 0 && bytes > 0) || becomes_ready(fd, POLLIN);
+}
+
+// Asks and reads in one call. A negative result says nothing about the pipe: older kernels cannot do this to one.
+ssize_t read_at_once(int fd, unsigned char* buffer, size_t size) {
+    constexpr int kNoWait = 8;  // RWF_NOWAIT, which headers may lack
+    static std::atomic<bool> possible{true};
+    if (read_with_flags == nullptr || !possible.load(std::memory_order_relaxed)) return -1;
+    iovec part = {buffer, size};
+    const ssize_t count = read_with_flags(fd, &part, 1, -1, kNoWait);
+    if (count < 0 && (errno == EOPNOTSUPP || errno == ENOSYS)) possible.store(false, std::memory_order_relaxed);
+    return count;
+}
+
 }  // namespace
 
 int make_pipe(int (&ends)[2]) {
@@ -55,12 +79,6 @@ void make_room(int fd, int frame_size) {
     if (current < 0) return;
     int wanted = std::min(kFramesOfRoom * frame_size, kLargestPipe);
     while (wanted > current && fcntl(fd, F_SETPIPE_SZ, wanted) < 0) wanted /= 2;
-}
-
-bool comes(int fd) {
-    // Far cheaper than a poll, which tells no more when something is there.
-    int bytes = 0;
-    return (ioctl(fd, FIONREAD, &bytes) == 0 && bytes > 0) || becomes_ready(fd, POLLIN);
 }
 
 bool write_rest(int fd, const unsigned char* data, size_t length, ssize_t count) {
@@ -101,6 +119,13 @@ ssize_t read_rest(int fd, unsigned char* buffer, size_t room, size_t length, ssi
         if (filled == room) filled = 0;
         count = read(fd, buffer + filled, std::min(length - total, room - filled));
     }
+}
+
+ssize_t read_all_that_comes(int fd, unsigned char* buffer, size_t room, size_t length) {
+    const ssize_t count = read_at_once(fd, buffer, std::min(length, room));
+    if (count == static_cast<ssize_t>(length)) return count;
+    if (count >= 0) return read_rest(fd, buffer, room, length, count, true);
+    return comes(fd) ? read_all(fd, buffer, room, length, true) : 0;
 }
 
 }  // namespace tavo

@@ -24,9 +24,6 @@ inline bool write_all(int fd, const unsigned char* data, size_t length) {
     return __builtin_expect(count == static_cast<ssize_t>(length), 1) || write_rest(fd, data, length, count);
 }
 
-// Waits up to a second until something can be read, or the other side has gone.
-bool comes(int fd);
-
 // Reads length bytes, with one read when they are all there and the buffer holds them; a buffer that does not is
 // filled from its start again and again. Waits for bytes that are late, up to a second each time. Fewer than length
 // when the time or the file has ended; -1 and errno when the read failed before the first byte. begun says that the
@@ -36,5 +33,9 @@ inline ssize_t read_all(int fd, unsigned char* buffer, size_t room, size_t lengt
     if (__builtin_expect(count == static_cast<ssize_t>(length), 1)) return count;
     return read_rest(fd, buffer, room, length, count, begun);
 }
+
+// read_all for what may never come, its sender having been killed in front of it: waits up to a second for the first
+// byte, too. 0 when there is none. The bytes before these have been read already.
+ssize_t read_all_that_comes(int fd, unsigned char* buffer, size_t room, size_t length);
 
 }  // namespace tavo

@@ -2,6 +2,7 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <poll.h>
+#include <sys/uio.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -71,6 +72,28 @@ ssize_t scripted(size_t size, ssize_t (*real)(int, void*, size_t), int fd, void*
 
 ssize_t scripted_read(int fd, void* data, size_t size) { return scripted(size, read, fd, data); }
 
+// Reading without waiting, for which there is a call of its own.
+ssize_t scripted_preadv2(int fd, const iovec* parts, int, off_t, int flags) {
+    static int passed_on;
+    passed_on = flags;
+    return scripted(
+        parts->iov_len,
+        [](int from, void* to, size_t count) {
+            const iovec part = {to, count};
+            return preadv2(from, &part, 1, -1, passed_on);
+        },
+        fd, parts->iov_base);
+}
+
+int g_refusals;
+
+// As older kernels do it.
+ssize_t refusing_preadv2(int, const iovec*, int, off_t, int) {
+    ++g_refusals;
+    errno = EOPNOTSUPP;
+    return -1;
+}
+
 ssize_t scripted_write(int fd, const void* data, size_t size) {
     return scripted(
         size, [](int to, void* from, size_t count) { return write(to, from, count); }, fd, const_cast<void*>(data));
@@ -85,7 +108,10 @@ void script(std::vector<int> steps) {
 TEST(MessageQueueFrames, AWholeFrameCostsTwoReadsAndNoWait) {
     TAVO_MessageQueue queue;
     const PlatformHook read_hook(kLibrary, "read", scripted_read);
+    const PlatformHook preadv2_hook(kLibrary, "preadv2", scripted_preadv2);
     const PlatformHook poll_hook(kLibrary, "poll", remembering_poll);
+    EXPECT_EQ(put(queue, std::string(4096, 'w')), 0);
+    EXPECT_EQ(get(queue), std::string(4096, 'w'));  // here the library learns what the kernel can
     for (const size_t size : {0U, 1U, 4092U, 4096U, 65536U, 409600U}) {
         ASSERT_EQ(put(queue, std::string(size, 'w')), 0);
         script({});
@@ -93,6 +119,48 @@ TEST(MessageQueueFrames, AWholeFrameCostsTwoReadsAndNoWait) {
         EXPECT_EQ(g_calls, 2U) << size;
         EXPECT_TRUE(g_waits.empty());
     }
+}
+
+TEST(MessageQueueFrames, AKernelThatCannotReadWithoutWaitingIsAskedOnce) {
+    TAVO_MessageQueue queue;
+    const PlatformHook preadv2_hook(kLibrary, "preadv2", refusing_preadv2);
+    const PlatformHook poll_hook(kLibrary, "poll", expired_poll);
+    script({});
+    for (const char c : {'a', 'b', 'c'}) {
+        ASSERT_EQ(put(queue, std::string(8192, c)), 0);
+        EXPECT_EQ(get(queue), std::string(8192, c));
+    }
+    EXPECT_EQ(g_refusals, 1);
+    EXPECT_TRUE(g_waits.empty());
+
+    write_raw(queue, frame(4096, ""));
+    EXPECT_EQ(get(queue), "");
+    ASSERT_EQ(g_waits.size(), 1U);
+    EXPECT_EQ(g_waits[0].timeout, 1000);
+}
+
+TEST(MessageQueueFrames, AFrameOfWholePagesThatComesInPartsIsWaitedFor) {
+    TAVO_MessageQueue queue;
+    const PlatformHook preadv2_hook(kLibrary, "preadv2", scripted_preadv2);
+    const PlatformHook poll_hook(kLibrary, "poll", remembering_poll);
+    // Nothing yet, twice; an interruption; a part. The rest is there when it is asked for again, and none of these
+    // means that the kernel cannot do it.
+    for (const int first : {-EAGAIN, -EAGAIN, -EINTR, 100}) {
+        ASSERT_EQ(put(queue, std::string(4096, 'p')), 0);
+        script({first});
+        EXPECT_EQ(get(queue), std::string(4096, 'p')) << first;
+        EXPECT_EQ(g_calls, 1U) << first;
+    }
+}
+
+TEST(MessageQueueFrames, TheEndOfTheWritersBehindALengthOfWholePagesYieldsNothingAtOnce) {
+    TAVO_MessageQueue queue;
+    write_raw(queue, frame(4096, ""));
+    queue.tavo_android_msg_queue_set_write_fd(-1);
+    script({});
+    const PlatformHook hook(kLibrary, "poll", remembering_poll);
+    EXPECT_EQ(get(queue), "");
+    for (const Wait& wait : g_waits) EXPECT_EQ(wait.result, 1);  // none of them ran out
 }
 
 TEST(MessageQueueFrames, AFrameOfWholePagesOfWhichOnlyTheLengthIsThereYieldsNothingAfterASecond) {
