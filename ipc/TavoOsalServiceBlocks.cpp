@@ -20,8 +20,9 @@
 namespace tavo {
 
 std::mutex& service_lock() {
-    // Never destroyed: the binder threads are still there when static objects go.
-    static std::mutex& lock = *new std::mutex;
+    // Never destroyed: the binder threads are still there when static objects go. In memory that is always there.
+    alignas(std::mutex) static unsigned char memory[sizeof(std::mutex)];
+    static std::mutex& lock = *new (memory) std::mutex;
     return lock;
 }
 

@@ -79,7 +79,7 @@ void ProcessState::spawnPooledThread(bool isMain) { startPooledThread(isMain); }
 bool ProcessState::startPooledThread(bool isMain) {
     if (!mThreadPoolStarted.load() || mDriver == nullptr) return false;
     pthread_attr_t attributes;
-    pthread_attr_init(&attributes);
+    if (pthread_attr_init(&attributes) != 0) return false;
     pthread_attr_setdetachstate(&attributes, PTHREAD_CREATE_DETACHED);
     pthread_t thread;
     const int error = pthread_create(&thread, &attributes, runPoolThread, isMain ? this : nullptr);

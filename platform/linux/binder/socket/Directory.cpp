@@ -123,6 +123,7 @@ std::shared_ptr<Link> Directory::linkThrough(UniqueFd connection) {
         if (link->instance() == welcome.instance && link->peer().pid == pid && !link->dead()) return link;
     }
     welcome.node = 0;
+    links_.reserve(links_.size() + 1);  // first: a link that is not noted would stay for nothing
     std::shared_ptr<Link> link = neighbourhood_.addLink(std::move(connection), &welcome);
     if (link != nullptr) links_.push_back(link);
     return link;

@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <new>
 #include <utility>
 
 #include "../Driver.h"
@@ -76,6 +77,22 @@ ssize_t sendMessage(int fd, iovec* parts, size_t count, const std::vector<int>& 
 // Errors that have nothing to do with what is sent.
 bool isOfTheConnection(int error) { return error == EAGAIN || error == EPIPE || error == ECONNRESET; }
 
+// Without the memory to note them, they are closed, as they would be nobody's.
+void keepDescriptors(const unsigned char* data, size_t count, std::vector<UniqueFd>& descriptors) {
+    const auto descriptorAt = [data](size_t i) {
+        int descriptor = -1;
+        memcpy(&descriptor, data + i * sizeof descriptor, sizeof descriptor);
+        return descriptor;
+    };
+    try {
+        descriptors.reserve(descriptors.size() + count);
+    } catch (const std::bad_alloc&) {
+        for (size_t i = 0; i < count; ++i) close(descriptorAt(i));
+        throw;
+    }
+    for (size_t i = 0; i < count; ++i) descriptors.emplace_back(descriptorAt(i));
+}
+
 }  // namespace
 
 ssize_t receive(int fd, iovec* buffers, size_t bufferCount, int flags, std::vector<UniqueFd>& descriptors, bool& lost,
@@ -98,13 +115,7 @@ ssize_t receive(int fd, iovec* buffers, size_t bufferCount, int flags, std::vect
     for (cmsghdr* part = CMSG_FIRSTHDR(&message); part != nullptr; part = CMSG_NXTHDR(&message, part)) {
         if (part->cmsg_level != SOL_SOCKET) continue;
         if (part->cmsg_type == SCM_RIGHTS) {
-            const size_t received = (part->cmsg_len - CMSG_LEN(0)) / sizeof(int);
-            descriptors.reserve(descriptors.size() + received);
-            for (size_t i = 0; i < received; ++i) {
-                int descriptor = -1;
-                memcpy(&descriptor, CMSG_DATA(part) + i * sizeof(int), sizeof(int));
-                descriptors.emplace_back(descriptor);
-            }
+            keepDescriptors(CMSG_DATA(part), (part->cmsg_len - CMSG_LEN(0)) / sizeof(int), descriptors);
         } else if (part->cmsg_type == kScmPidfd) {
             int process = -1;
             memcpy(&process, CMSG_DATA(part), sizeof process);

@@ -72,6 +72,7 @@ public:
 
     int fd() const override { return control_.get(); }
     void onReady() override;
+    void giveUp() override { cut(); }
 
     // Whom this process connected to, or what a newcomer's Hello says. Nothing else is taken before.
     void greet(const Greeting& greeting);

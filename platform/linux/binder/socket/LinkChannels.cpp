@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
+#include <new>
 
 #include "Frame.h"
 #include "Link.h"
@@ -61,6 +62,7 @@ status_t Link::takeChannel(Purpose purpose, bool mayBeFresh, Channel& channel) {
             ++channels.open;
             channel.isFresh_ = true;
         } else {
+            calling_.reserve(calling_.size() + 1);  // first: nothing has changed when there is no memory
             channel.fd_ = std::move(channels.idle.back());
             channels.idle.pop_back();
             calling_.push_back(channel.fd());
@@ -91,11 +93,13 @@ void Link::returnChannel(Channel& channel) {
     const std::lock_guard<std::mutex> lock(mutex_);
     calling_.erase(std::remove(calling_.begin(), calling_.end(), channel.fd()), calling_.end());
     Outgoing& channels = outgoing(channel.purpose_);
-    if (channel.inOrder_ && !dead_ && channels.idle.size() < kMaxIdle) {
-        channels.idle.push_back(std::move(channel.fd_));
-    } else {
-        --channels.open;
+    bool isKept = channel.inOrder_ && !dead_ && channels.idle.size() < kMaxIdle;
+    try {
+        if (isKept) channels.idle.push_back(std::move(channel.fd_));
+    } catch (const std::bad_alloc&) {
+        isKept = false;
     }
+    if (!isKept) --channels.open;
     // Closed under the lock if at all: cut() must not meet another descriptor of the same number.
     channel.fd_.reset();
     changed_.notify_all();

@@ -1,8 +1,18 @@
 #include "Poller.h"
 
+#include <new>
+
 namespace android::socket_driver {
 
 std::atomic<uint64_t> Endpoint::lastId_{0};
+
+void Endpoint::tend() {
+    try {
+        onReady();
+    } catch (const std::bad_alloc&) {
+        giveUp();
+    }
+}
 
 bool Baton::take() {
     int state = kFree;

@@ -38,6 +38,10 @@ public:
     virtual int fd() const = 0;
     // Called by whoever polls; with several threads, on several at once.
     virtual void onReady() = 0;
+    // There is no memory to go on with: whoever is at the other end is to learn of it.
+    virtual void giveUp() {}
+    // onReady(), which runs out of memory at this connection's cost and nobody else's.
+    void tend();
 
     // Never used again for another.
     const uint64_t id;

@@ -38,6 +38,7 @@ public:
 
     int fd() const override { return socket_.get(); }
     void onReady() override;
+    void giveUp() override { link_->cut(); }
 
     const std::shared_ptr<Link>& link() const { return link_; }
     Purpose purpose() const { return purpose_; }

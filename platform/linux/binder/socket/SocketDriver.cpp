@@ -6,6 +6,7 @@
 #include <sys/random.h>
 
 #include <cstring>
+#include <new>
 #include <utility>
 
 #include "../Forked.h"
@@ -95,14 +96,18 @@ void SocketDriver::work() {
     }
     const std::shared_ptr<Endpoint> endpoint = pool_.next();
     threads_.endWait();
-    if (endpoint != nullptr) endpoint->onReady();
+    if (endpoint != nullptr) endpoint->tend();
 }
 
 void SocketDriver::doErrand(Errand errand) {
     const RunningCalls::Call running(running_);
     keepReader();
     const Errand own = std::move(errand);  // what it holds goes away while the call still counts
-    own.run();
+    try {
+        own.run();
+    } catch (const std::bad_alloc&) {
+        // Who waits for what comes of it has been told by then.
+    }
 }
 
 // On the platform a process without a pool learns of nothing. Here at least what it gave away comes back to
@@ -134,7 +139,7 @@ bool SocketDriver::startHousekeeper() {
     const std::lock_guard<std::mutex> lock(houseMutex_);
     if (hasHousekeeper_) return true;
     pthread_attr_t attributes;
-    pthread_attr_init(&attributes);
+    if (pthread_attr_init(&attributes) != 0) return false;
     pthread_attr_setdetachstate(&attributes, PTHREAD_CREATE_DETACHED);
     // The program's signals are for the program's threads.
     sigset_t all, before;
@@ -157,13 +162,13 @@ void SocketDriver::keepHouse() {
     pthread_setname_np(pthread_self(), "Binder_house");
     keepsHouse_ = true;
     for (;;) {
-        if (const std::shared_ptr<Endpoint> endpoint = house_.next()) endpoint->onReady();
+        if (const std::shared_ptr<Endpoint> endpoint = house_.next()) endpoint->tend();
     }
 }
 
 void SocketDriver::sortArrivals() {
     if (leaveArrivals()) return;
-    if (const std::shared_ptr<Endpoint> endpoint = pool_.next(false)) endpoint->onReady();
+    if (const std::shared_ptr<Endpoint> endpoint = pool_.next(false)) endpoint->tend();
 }
 
 // False while no thread of the pool would see to them.

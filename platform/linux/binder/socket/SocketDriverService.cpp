@@ -1,8 +1,10 @@
 // Transactions of others'.
 #include <binder/Parcel.h>
+#include <sys/socket.h>
 #include <utils/String8.h>
 
 #include <cerrno>
+#include <new>
 #include <utility>
 
 #include "SocketDriver.h"
@@ -207,7 +209,11 @@ bool SocketDriver::serveLookUp(Arrival& arrival, const std::string& name) {
     }
     // Passing on somebody else's object takes a call to its owner, which is nothing for the housekeeper.
     errands_->push({[answerWith, channel = arrival.channel] {
-                        answerWith();
+                        try {
+                            answerWith();
+                        } catch (const std::bad_alloc&) {
+                            channel->giveUp();
+                        }
                         channel->resume();
                     },
                     true, arrival.channel->link().get()});
@@ -239,9 +245,12 @@ bool SocketDriver::answer(Link& link, status_t status, const Parcel& reply, Send
 }
 
 void SocketDriver::answer(ServedChannel& channel, status_t status, const Parcel& reply) {
-    answer(*channel.link(), status, reply, [&channel](const OutgoingFrame& frame, UsedHandles handles) {
-        return channel.send(frame, std::move(handles));
-    });
+    const bool answered =
+        answer(*channel.link(), status, reply, [&channel](const OutgoingFrame& frame, UsedHandles handles) {
+            return channel.send(frame, std::move(handles));
+        });
+    // Where the peer is still there after all, it is not to wait for ever.
+    if (!answered) shutdown(channel.fd(), SHUT_RDWR);
 }
 
 }  // namespace android::socket_driver
