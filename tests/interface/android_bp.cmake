@@ -61,7 +61,7 @@ list(FILTER version_scripts INCLUDE REGEX "version-script=")
 list(TRANSFORM version_scripts REPLACE ".*version-script=" "")
 json_list(version_scripts ${version_scripts})
 
-# The tests, but those of what Android has and Linux lacks, of the command, of the testing kit, and what reads JSON.
+# The tests, but those of what Android has and Linux lacks, of every platform call failing (glibc's), of the command, of the testing kit, and what reads JSON.
 json_sources(support tavo_test_support)
 json_sources(kit tavo_testing)
 get_property(names GLOBAL PROPERTY TAVO_TESTS)
@@ -69,7 +69,7 @@ set(tests "")
 foreach(name IN LISTS names)
     get_target_property(folder ${name} SOURCE_DIR)
     get_target_property(libraries ${name} LINK_LIBRARIES)
-    if(NOT folder MATCHES "/tests/(platform|testing|tools)" AND NOT libraries MATCHES "json")
+    if(NOT folder MATCHES "/tests/(faults|platform|testing|tools)" AND NOT libraries MATCHES "json")
         json_sources(sources ${name})
         list(APPEND tests "\n    \"${name}\": ${sources}")
     endif()
