@@ -22,6 +22,7 @@
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/time.h>
+#include <sys/uio.h>
 #include <sys/wait.h>
 #include <unistd.h>
 #include <utils/Errors.h>
@@ -377,6 +378,7 @@ std::vector<Entry> all_entries() {
         entry<&poll>("poll", kFile, {EINVAL, EINTR}),
         own<&hooked_printf>("printf", kFile, {EIO}),
         entry<&pwrite>("pwrite", kFile, {ENOSPC}),
+        entry<&preadv2>("preadv2", kFile, {EAGAIN, EIO, EINTR, EOPNOTSUPP}),
         entry<&read>("read", kFile, {EIO, EINTR}),
         entry<&readdir>("readdir", kFile, {EIO}),
         entry<&renameat>("renameat", kFile, {EACCES}),

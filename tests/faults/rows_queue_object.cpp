@@ -125,6 +125,8 @@ std::vector<Scenario> gets(bool through_handle) {
     // Behind the length, an interruption is no reason to stop.
     std::vector<Expectation> whole = all;
     whole.push_back({{"read"}, 2, {same()}, nullptr, EINTR});
+    // What cannot be read without waiting is asked for, and read then.
+    whole.push_back(on({"preadv2"}, {same()}));
     // Behind the first part, what has come is the message.
     std::vector<Expectation> parts = whole;
     const Outcome cut_short = fails(through_handle ? 0 : 3);
