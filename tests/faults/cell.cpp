@@ -274,12 +274,24 @@ bool settles(Service& service, const Held& before, const std::string& figures_be
         if (!service.ask()) return false;
         const Held& now = plan().service_held;
         if (figures_before != plan().figures) return true;
-        if (now.descriptors == before.descriptors && now.mappings == before.mappings) {
-            return true;
-        }
+        if (now.descriptors <= before.descriptors && now.mappings <= before.mappings) return true;
         if (steady_clock::now() >= deadline) return true;
         std::this_thread::sleep_for(milliseconds(1));
     }
+}
+
+// Without a fault there is nothing to compare with: until what it holds stays as it is for a while.
+bool comes_to_rest(Service& service) {
+    constexpr int kWhile = 20;
+    Held latest = {};
+    for (int same = 0; same < kWhile; ++same) {
+        if (!service.ask()) return false;
+        const Held& now = plan().service_held;
+        if (now.descriptors != latest.descriptors || now.mappings != latest.mappings) same = 0;
+        latest = now;
+        std::this_thread::sleep_for(milliseconds(1));
+    }
+    return true;
 }
 
 }  // namespace
@@ -319,7 +331,8 @@ Trial tried(const Scenario& scenario, const Fault* fault) {
             close(output);
             return result;
         }
-        result.service_lives = fault != nullptr ? settles(*service, service_before, figures_before) : service->ask();
+        result.service_lives =
+            fault != nullptr ? settles(*service, service_before, figures_before) : comes_to_rest(*service);
         result.service_held = now.service_held;
         result.figures = now.figures;
         if (fault == nullptr) service_before = result.service_held;

@@ -5,8 +5,10 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
+#include <thread>
 
 #include "faults/driver.h"
 #include "faults/plan.h"
@@ -83,9 +85,17 @@ std::vector<Outcome> attach_outcomes() {
 void destroy_queue(long result) {
     if (result == 0) tavo_msg_queue_destroy(g_queue);
 }
+// What a call is to find, also when the fault of the call before has cut a connection, which is noticed a little later.
+template <typename Call>
+void prepare(Call call) {
+    for (int attempts = 0; call() != 0; ++attempts) {
+        if (attempts == 1000) abort();
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    }
+}
 // So that what a process does once is done.
 void get_to_know_the_service() {
-    tavo_msg_queue_init(9, &g_queue);
+    prepare([] { return tavo_msg_queue_init(9, &g_queue); });
     tavo_msg_queue_destroy(g_queue);
 }
 
@@ -123,8 +133,11 @@ std::vector<Scenario> destructions() {
     const auto undo = [](long result) {
         if (result != 0) Destroy(g_queue);
     };
-    Scenario client = {
-        "", [] { tavo_msg_queue_init(7, &g_queue); }, call, undo, {on({}, destroy_outcomes()), locks(), peers()}};
+    Scenario client = {"",
+                       [] { prepare([] { return tavo_msg_queue_init(7, &g_queue); }); },
+                       call,
+                       undo,
+                       {on({}, destroy_outcomes()), locks(), peers()}};
     client.service = true;
     Scenario served = client;
     served.name = "in the service";
@@ -212,7 +225,7 @@ TAVO_Status release_by_size() { return tavo_shm_release_by_size(100, g_address);
 
 void acquire_block() {
     make_handle();
-    tavo_shm_acquire(g_block, &g_address);
+    prepare([] { return tavo_shm_acquire(g_block, &g_address); });
 }
 
 template <TAVO_Status (*Release)()>

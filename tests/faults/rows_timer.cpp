@@ -2,6 +2,7 @@
 #include <unistd.h>
 
 #include <atomic>
+#include <cstddef>
 
 #include "faults/plan.h"
 #include "faults/row.h"
@@ -80,9 +81,22 @@ std::vector<Row> clock_rows() {
     };
 }
 
+// Of what the worker says, the call has seen what came before its end.
+std::vector<Outcome> said_so_far(const std::vector<Line>& lines, const char* kept = nullptr) {
+    std::vector<Outcome> outcomes;
+    for (size_t said = 0; said <= lines.size(); ++said) {
+        outcomes.push_back(same_but({lines.begin(), lines.begin() + static_cast<std::ptrdiff_t>(said)}));
+        if (kept != nullptr) outcomes.push_back(Outcome(outcomes.back()).keeping_blocks(1, kept));
+    }
+    return outcomes;
+}
+
 std::vector<Row> framework_rows() {
     const Line no_block = {TAVO_LOG_ERROR, "OSAL_MEM", "Memory not allocated. Size Requested: *.\n"};
     const std::vector<Line> no_lock = {of_threads("Mutex lock failed. Error=22\n"), error("Mutex lock failed.\n")};
+    const Line no_unlock = of_threads("Mutex unlock failed. Error=1\n");
+    std::vector<Outcome> not_unlocked = said_so_far({no_unlock, error("Mutex unlock failed \n")});
+    not_unlocked.push_back(same_but({no_unlock, error("Mutex unlock failed.\n")}));
     const Expectation ledger = skip({"pthread_mutex_lock", "pthread_mutex_unlock"}, kLedger);
     return {
         {"tavo_osal_timer_framework_init",
@@ -116,11 +130,8 @@ std::vector<Row> framework_rows() {
            drop_framework,
            // A round that could not be locked is gone through as if it had been; one that could not be unlocked is cut
            // short, and timers fire a tick later, but for the one that was to fire: that stays at 0 until the next.
-           {on({"pthread_mutex_lock"}, {same_but(no_lock), same_but(no_lock).keeping_blocks(1, kUnlockedTwice)}),
-            on({"pthread_mutex_unlock"},
-               {same_but({of_threads("Mutex unlock failed. Error=1\n"), error("Mutex unlock failed \n")}),
-                same_but({of_threads("Mutex unlock failed. Error=1\n"), error("Mutex unlock failed.\n")})}),
-            on({"usleep"}, {same_but({of_threads("Sleep failed.\n")})})},
+           {on({"pthread_mutex_lock"}, said_so_far(no_lock, kUnlockedTwice)),
+            on({"pthread_mutex_unlock"}, not_unlocked), on({"usleep"}, said_so_far({of_threads("Sleep failed.\n")}))},
            false,
            Side::kClient,
            true}}},
